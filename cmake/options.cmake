@@ -1,7 +1,7 @@
 # Compiler and linker options of all our targets.
 add_library(project_options INTERFACE)
 target_compile_options(project_options INTERFACE
-    -Wall -Wextra -Wpedantic -Wshadow -Wconversion -Wformat=2 -Wundef
+    -Wall -Wextra -Wpedantic $<$<CXX_COMPILER_ID:GNU>:-Wshadow=local> -Wconversion -Wformat=2 -Wundef
     # Log lines carry paths relative to the source root.
     "-fmacro-prefix-map=${PROJECT_SOURCE_DIR}/=")
 if(ISCSIWEBAPI_WERROR)

@@ -6,10 +6,10 @@
 
 /// Kinds of query; the field of the query record that each reads is named behind it.
 enum {
-    NORV_CONF_TARGET_BY_ID = 0x1001,   ///< tid: that target
-    NORV_CONF_TARGET_BY_NAME = 0x1004, ///< name: that target
-    NORV_CONF_ALL_TARGETS = 0x7000,    ///< every target, ascending by ID
-    NORV_CONF_TARGETS_OF_LUN = 0x7020, ///< lun: the targets it is mapped to, with its mapping entries
+    NORV_CONF_TARGET_BY_ID = 0x1001,    ///< tid: that target
+    NORV_CONF_TARGET_BY_NAME = 0x1004,  ///< name: that target
+    NORV_CONF_ALL_TARGETS = 0x7000,     ///< every target, ascending by ID
+    NORV_CONF_TARGETS_OF_LUN = 0x7020,  ///< lun: the targets it is mapped to, with its mapping entries
     NORV_CONF_MAPPINGS_OF_LUN = 0x7220, ///< lid: its mapping entries
 };
 

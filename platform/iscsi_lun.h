@@ -9,7 +9,11 @@
 
 /// Kind of a LUN, a bit set in which each kind adds a bit to the one before it. All of the bits 1,
 /// 2, 4 and 8 mark an extent-pool LUN: sparse, snapshot-capable.
-typedef enum _tag_iscsi_lun_type_ {
+enum _tag_iscsi_lun_type
+#ifdef __cplusplus
+    : int32_t
+#endif
+{
     NORV_LUN_TYPE_NONE = 0,
     NORV_LUN_TYPE_BLOCK = 1, ///< a block device; the location is the device's path
     NORV_LUN_TYPE_FILE = 3,  ///< a file allocated in full
@@ -19,7 +23,7 @@ typedef enum _tag_iscsi_lun_type_ {
     NORV_LUN_TYPE_47 = 47,
     NORV_LUN_TYPE_71 = 71,
     NORV_LUN_TYPE_79 = 79,
-} _tag_iscsi_lun_type;
+};
 
 enum {
     NORV_LUN_EXTENT_POOL_BITS = 15,

@@ -780,10 +780,10 @@ struct Range {
 };
 
 inline constexpr Range ranges[] = {
-    {18990000, 18990057, 0}, // General
-    {18990200, 18990213, 58}, // Web-API client
-    {18990300, 18990316, 72}, // Configuration and volume
-    {18990400, 18990426, 89}, // Extent pool and EP files
+    {18990000, 18990057, 0},   // General
+    {18990200, 18990213, 58},  // Web-API client
+    {18990300, 18990316, 72},  // Configuration and volume
+    {18990400, 18990426, 89},  // Extent pool and EP files
     {18990500, 18990595, 116}, // LUN and snapshot
     {18990700, 18990733, 212}, // Target
     {18990800, 18990887, 246}, // Replication

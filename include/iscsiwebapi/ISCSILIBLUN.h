@@ -20,8 +20,8 @@ public:
 
     ISCSILIBLUN() = default;
     explicit ISCSILIBLUN(const std::string &uuid);
-    ISCSILIBLUN(const std::string &name, _tag_iscsi_lun_type type, const std::string &location,
-                unsigned long long size, unsigned int extent_size);
+    ISCSILIBLUN(const std::string &name, _tag_iscsi_lun_type type, const std::string &location, unsigned long long size,
+                unsigned int extent_size);
     virtual ~ISCSILIBLUN();
 
     /// Refreshes `info` and `record`; `flags` are ISCSILUNInfo::LoadFlags.

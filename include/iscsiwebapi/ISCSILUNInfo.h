@@ -111,10 +111,6 @@ public:
     /// Resolves a selector: a UUID (whose LUN need not exist), "lun#" and a 1-based index into the
     /// list, or a name. An empty selector gives an empty UUID. ERR_BAD_LUN_UUID for none of these.
     static int GetLUNUUID(const std::string &selector, std::string &uuid);
-
-private:
-    int loadRecord(_tag_iscsi_lun_ &record, const char *method);
-    int loadLiveState(_tag_iscsi_lun_ &record, int flags, const char *method);
 };
 
 } // namespace ISCSI

@@ -18,9 +18,9 @@ public:
     /// Stands for a CHAP mode that the library does not know.
     static constexpr unsigned int AUTH_UNKNOWN = 0xFFFFFFFF;
 
-    unsigned int tid = 0; ///< 1 to 256, 0 = not created yet
-    std::string name;     ///< at most 255 bytes
-    std::string iqn;      ///< at most 255 bytes
+    unsigned int tid = 0;  ///< 1 to 256, 0 = not created yet
+    std::string name;      ///< at most 255 bytes
+    std::string iqn;       ///< at most 255 bytes
     int mapping_index = 0; ///< when listed for a LUN: its LUN number in this target; -1 in a full list
     bool is_enabled = false;
     bool has_header_checksum = false;

@@ -1,0 +1,46 @@
+/// Owners of what the platform allocates: freed on every path.
+#pragma once
+
+#include "platform/iscsi_config.h"
+#include "platform/iscsi_lun.h"
+
+#include <cstdlib>
+#include <memory>
+
+namespace ISCSI {
+
+struct FreeConf {
+    void operator()(_tag_iscsi_conf_ *conf) const { NORViSCSIConfFree(conf); }
+};
+using Conf = std::unique_ptr<_tag_iscsi_conf_, FreeConf>;
+
+struct FreeList {
+    void operator()(void *list) const { free(list); }
+};
+using LUNRecords = std::unique_ptr<_tag_iscsi_lun_[], FreeList>;
+
+/// NORViSCSIConfGet with an owned answer.
+inline int queryConf(const _tag_iscsi_conf_query_ &query, Conf &out)
+{
+    _tag_iscsi_conf_ *conf = nullptr;
+    const int err = NORViSCSIConfGet(&query, &conf);
+    out.reset(conf);
+    return err;
+}
+
+/// Whether the LUN is mapped to any target; entries with other target IDs are the SDK's own.
+inline int queryIsMapped(int lid, bool &out)
+{
+    _tag_iscsi_conf_query_ query{};
+    query.kind = NORV_CONF_MAPPINGS_OF_LUN;
+    query.lid = lid;
+    Conf conf;
+    if (int err = queryConf(query, conf))
+        return err;
+    out = false;
+    for (const _tag_iscsi_mapping_ *mapping = conf->mappings; mapping && !out; mapping = mapping->next)
+        out = mapping->tid >= 1 && mapping->tid <= NORV_TARGET_ID_MAX;
+    return 0;
+}
+
+} // namespace ISCSI

@@ -1,0 +1,74 @@
+#include "etc/Text.h"
+
+#include <ctime>
+
+namespace ISCSI {
+
+std::string FormatSize(uint64_t bytes)
+{
+    static const char *const units[] = {"bytes", "KB", "MB", "GB", "TB", "PB", "EB"};
+
+    if (bytes == 0)
+        return "0bytes";
+    std::string text;
+    for (unsigned unit = 7; unit-- > 0;) {
+        const uint64_t group = (bytes >> (10 * unit)) & (unit == 6 ? 15 : 1023);
+        if (group == 0)
+            continue;
+        if (!text.empty())
+            text += ',';
+        text += std::to_string(group);
+        text += units[unit];
+    }
+    return text;
+}
+
+TextLine &TextLine::add(const char *label, const std::string &value)
+{
+    line += label;
+    line += value;
+    return *this;
+}
+
+TextLine &TextLine::add(const char *label, const char *value)
+{
+    line += label;
+    line += value;
+    return *this;
+}
+
+TextLine &TextLine::add(const char *label, int value)
+{
+    return add(label, std::to_string(value));
+}
+
+TextLine &TextLine::add(const char *label, unsigned int value)
+{
+    return add(label, std::to_string(value));
+}
+
+TextLine &TextLine::add(const char *label, bool value)
+{
+    return add(label, boolText(value));
+}
+
+TextLine &TextLine::addSize(const char *label, uint64_t bytes)
+{
+    add(label, std::to_string(bytes));
+    line += " (";
+    line += FormatSize(bytes);
+    line += ')';
+    return *this;
+}
+
+TextLine &TextLine::addTime(const char *label, long seconds)
+{
+    const time_t time = seconds;
+    tm local{};
+    char text[32] = "";
+    if (localtime_r(&time, &local) && strftime(text, sizeof(text), "%a %b %d %H:%M:%S %Z %Y", &local) == 0)
+        text[0] = '\0';
+    return add(label, static_cast<const char *>(text));
+}
+
+} // namespace ISCSI
