@@ -269,7 +269,9 @@ int ISCSILUNInfo::GetLUNUUID(const std::string &selector, std::string &uuid)
     return resolveSelector<ISCSILUNInfo>(
         SELECTOR, selector, [](std::vector<ISCSILUNInfo> &luns) { return ListLUN(luns, 0); },
         [&](const ISCSILUNInfo &lun) { uuid = lun.uuid; },
-        [&](const std::string &name) { return GetUUIDByLUNName(name, uuid); });
+        [&, site = here()](const std::string &name) {
+            return GetUUIDByLUNName(name, uuid) ? failInvalid(SELECTOR, name, site) : 0;
+        });
 }
 
 } // namespace ISCSI

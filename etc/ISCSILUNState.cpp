@@ -33,34 +33,22 @@ int loadRecord(const ISCSILUNInfo &info, _tag_iscsi_lun_ &record, Site site)
     return 0;
 }
 
-/// The path of a LUN's map file; what does not fit the platform's limit is cut.
-class MapFilePath {
-public:
-    explicit MapFilePath(const _tag_iscsi_lun_ &record)
-    {
-        constexpr int LONG_NUMBER_BITS = 71;
-        const char *format = hasTypeBits(record, NORV_LUN_EXTENT_POOL_BITS) ? "_Extent" : "";
-        const int width = hasTypeBits(record, LONG_NUMBER_BITS) ? 5 : 3;
-        char name[256];
-        cut(name, snprintf(name, sizeof(name), "iSCSI_%d%s_%.*s_%0*d", record.lid, format,
-                           static_cast<int>(sizeof(record.name)), record.name, width, 0));
-        const char *folder = record.options & NORV_LUN_OPTION_TRASH ? "@EP_trash" : "@iSCSITrg";
-        cut(path, snprintf(path, sizeof(path), "%.*s/%s/%s", static_cast<int>(sizeof(record.location)), record.location,
-                           folder, name));
-    }
+BoundedText<256> mapFileName(const _tag_iscsi_lun_ &record)
+{
+    constexpr int LONG_NUMBER_BITS = 71;
+    const int width = hasTypeBits(record, LONG_NUMBER_BITS) ? 5 : 3;
+    const std::string name = fieldText(record.name);
+    if (hasTypeBits(record, NORV_LUN_EXTENT_POOL_BITS))
+        return BoundedText<256>("iSCSI_%d_Extent_%s_%0*d", record.lid, name.c_str(), width, 0);
+    return BoundedText<256>("iSCSI_%d_%s_%0*d", record.lid, name.c_str(), width, 0);
+}
 
-    const char *c_str() const { return path; }
-
-private:
-    template <size_t size>
-    static void cut(char (&text)[size], int length)
-    {
-        if (length < 0)
-            text[0] = '\0';
-    }
-
-    char path[320];
-};
+/// The path of a LUN's map file; what does not fit the platform's limits is cut.
+BoundedText<320> mapFilePath(const _tag_iscsi_lun_ &record)
+{
+    const char *folder = record.options & NORV_LUN_OPTION_TRASH ? "@EP_trash" : "@iSCSITrg";
+    return BoundedText<320>("%s/%s/%s", fieldText(record.location).c_str(), folder, mapFileName(record).c_str());
+}
 
 struct GlobResult : glob_t {
     GlobResult() : glob_t{} {}
@@ -117,7 +105,7 @@ int ISCSILUNInfo::loadAllocatedSize(_tag_iscsi_lun_ &record)
     if (int err = loadRecord(*this, record, here()))
         return err;
     if (hasTypeBits(record, NORV_LUN_EXTENT_POOL_BITS)) {
-        const MapFilePath path(record);
+        const auto path = mapFilePath(record);
         uint64_t bytes = 0;
         if (int err = NORVExtentPoolMapFileMappedSizeGet(path.c_str(), record.location, &bytes))
             return failText(here(), err, "Failed to get mapped size from %s", path.c_str());
@@ -183,7 +171,7 @@ int ISCSILUNInfo::getBaseVersion(std::string &out)
     if (int err = loadFromConfig(record, 0))
         return failText(here(), err, "Failed to load LUN info. LUN UUID: %s", uuid.c_str());
     char version[40] = {};
-    if (int err = NORVExtentPoolMapFileBaseVersionGet(MapFilePath(record).c_str(), version))
+    if (int err = NORVExtentPoolMapFileBaseVersionGet(mapFilePath(record).c_str(), version))
         return failText(here(), err, "Failed to get LUN base version. LUN UUID: %s", uuid.c_str());
     out = fieldText(version);
     return 0;
@@ -195,7 +183,7 @@ int ISCSILUNInfo::isModified(bool &out)
     if (int err = loadFromConfig(record, 0))
         return failText(here(), err, "Failed to load LUN info. LUN UUID: %s", uuid.c_str());
     _tag_map_file_version_ version{};
-    if (int err = NORVExtentPoolMapFileVersionInfoGet(MapFilePath(record).c_str(), &version))
+    if (int err = NORVExtentPoolMapFileVersionInfoGet(mapFilePath(record).c_str(), &version))
         return failText(here(), err, "Failed to get LUN version info. LUN UUID: %s", uuid.c_str());
     out = !sameVersion(version);
     return 0;
@@ -206,7 +194,7 @@ int ISCSILUNInfo::isSnapshotSentFailed(bool &out)
     _tag_iscsi_lun_ record{};
     if (int err = loadFromConfig(record, 0))
         return failText(here(), err, "Failed to load LUN info. LUN UUID: %s", uuid.c_str());
-    const MapFilePath path(record);
+    const auto path = mapFilePath(record);
     _tag_map_file_version_ version{};
     uint64_t total = 0;
     uint64_t synced = 0;
@@ -227,7 +215,7 @@ int ISCSILUNInfo::loadSyncProgress(_tag_iscsi_lun_ &record, unsigned long long &
     uint64_t done = 0;
     uint64_t total = 0;
     if (hasTypeBits(record, NORV_LUN_EXTENT_POOL_BITS)) {
-        if (int err = NORViSCSIChildLunSyncProgressGet(MapFilePath(record).c_str(), &done, &total))
+        if (int err = NORViSCSIChildLunSyncProgressGet(mapFilePath(record).c_str(), &done, &total))
             return fail(err, *this, "Failed to get LUN sync progress");
     }
     first = done;

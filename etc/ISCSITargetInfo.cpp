@@ -204,7 +204,9 @@ int ISCSITargetInfo::GetTID(const std::string &selector, int &tid)
     return resolveSelector<ISCSITargetInfo>(
         SELECTOR, selector, [](std::vector<ISCSITargetInfo> &targets) { return ListTarget(targets, ""); },
         [&](const ISCSITargetInfo &target) { tid = static_cast<int>(target.tid); },
-        [&](const std::string &name) { return GetTIDByTargetName(name, tid); });
+        [&, site = here()](const std::string &name) {
+            return GetTIDByTargetName(name, tid) ? failInvalid(SELECTOR, name, site) : 0;
+        });
 }
 
 } // namespace ISCSI

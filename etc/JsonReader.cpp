@@ -2,6 +2,20 @@
 
 namespace ISCSI {
 
+JsonReader &JsonReader::addTexts(const char *key, std::set<std::string> &out)
+{
+    if (!has(key) || !object[key].isArray())
+        return *this;
+    for (const auto &element : object[key]) {
+        std::string text;
+        if (read(element, text))
+            out.insert(std::move(text));
+        else
+            good = false;
+    }
+    return *this;
+}
+
 bool JsonReader::read(const Json::Value &value, int &out)
 {
     if (!value.isInt())

@@ -4,6 +4,7 @@
 
 #include <json/value.h>
 
+#include <set>
 #include <string>
 
 namespace ISCSI {
@@ -29,6 +30,9 @@ public:
             good = read(object[key], out) && good;
         return *this;
     }
+
+    /// Adds the texts of an array to a set; a member that is absent or no array adds none.
+    JsonReader &addTexts(const char *key, std::set<std::string> &out);
 
     bool ok() const { return good; }
 

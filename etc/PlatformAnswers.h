@@ -3,6 +3,7 @@
 
 #include "platform/iscsi_config.h"
 #include "platform/iscsi_lun.h"
+#include "platform/iscsi_snapshot.h"
 
 #include <cstdlib>
 #include <memory>
@@ -18,6 +19,38 @@ struct FreeList {
     void operator()(void *list) const { free(list); }
 };
 using LUNRecords = std::unique_ptr<_tag_iscsi_lun_[], FreeList>;
+
+using SnapshotRecord = std::unique_ptr<_tag_iscsi_snapshot_, FreeList>;
+
+/// A list of snapshot records, given up record by record so that no record is held twice.
+struct SnapshotRecords {
+    _tag_iscsi_snapshot_list_ head{};
+
+    SnapshotRecords() = default;
+    SnapshotRecords(const SnapshotRecords &) = delete;
+    SnapshotRecords &operator=(const SnapshotRecords &) = delete;
+    ~SnapshotRecords()
+    {
+        while (takeFirst()) {
+        }
+    }
+
+    /// Unlinks the first record; null at the end of the list.
+    SnapshotRecord takeFirst()
+    {
+        _tag_iscsi_snapshot_ *record = head.first;
+        if (record) {
+            head.first = record->next;
+            (record->next ? record->next->previous : head.last) = nullptr;
+        }
+        return SnapshotRecord(record);
+    }
+};
+
+struct FreeTextList {
+    void operator()(NLIBC_SZ_LIST *list) const { NLIBCSzListFree(list); }
+};
+using TextList = std::unique_ptr<NLIBC_SZ_LIST, FreeTextList>;
 
 /// NORViSCSIConfGet with an owned answer.
 inline int queryConf(const _tag_iscsi_conf_query_ &query, Conf &out)

@@ -26,27 +26,24 @@ bool isUUID(const std::string &text);
 bool isIndex(const SelectorKind &kind, const std::string &selector, unsigned int &index);
 
 int failOutOfRange(const SelectorKind &kind, unsigned int index, size_t count, Site site);
-int failInvalid(const SelectorKind &kind, const std::string &selector, Site site);
+int failInvalid(const SelectorKind &kind, const std::string &selector, Site site = here());
 
-/// Resolves the index form and, for anything else, the name. `list` fills a vector of records,
-/// `found` takes the record that the index names, `lookup` the name. Returns the listing's code when
-/// that fails, else the kind's bad code for a selector that names nothing.
+/// Resolves the index form, and leaves anything else to `lookup`. `list` fills a vector of records,
+/// `found` takes the record that the index names, `lookup` the selector; it logs its own failure.
+/// Returns the listing's code when that fails, the kind's bad code for an index out of range.
 template <class Record, class List, class Found, class Lookup>
 int resolveSelector(const SelectorKind &kind, const std::string &selector, List list, Found found, Lookup lookup,
                     Site site = here())
 {
     unsigned int index = 0;
-    if (isIndex(kind, selector, index)) {
-        std::vector<Record> records;
-        if (int err = list(records))
-            return failShort(site, err, "%s", kind.list_failed);
-        if (index < 1 || index > records.size())
-            return failOutOfRange(kind, index, records.size(), site);
-        found(records[index - 1]);
-        return 0;
-    }
-    if (lookup(selector))
-        return failInvalid(kind, selector, site);
+    if (!isIndex(kind, selector, index))
+        return lookup(selector);
+    std::vector<Record> records;
+    if (int err = list(records))
+        return failShort(site, err, "%s", kind.list_failed);
+    if (index < 1 || index > records.size())
+        return failOutOfRange(kind, index, records.size(), site);
+    found(records[index - 1]);
     return 0;
 }
 

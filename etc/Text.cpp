@@ -3,6 +3,23 @@
 #include <ctime>
 
 namespace ISCSI {
+namespace {
+
+/// False for a time that no calendar holds.
+bool localTime(long seconds, tm &local)
+{
+    const time_t time = seconds;
+    return localtime_r(&time, &local) != nullptr;
+}
+
+} // namespace
+
+EventTime::EventTime(long seconds)
+{
+    tm local;
+    if (!localTime(seconds, local) || strftime(text, sizeof(text), "%Y/%m/%d %T", &local) == 0)
+        text[0] = '\0';
+}
 
 std::string FormatSize(uint64_t bytes)
 {
@@ -63,10 +80,9 @@ TextLine &TextLine::addSize(const char *label, uint64_t bytes)
 
 TextLine &TextLine::addTime(const char *label, long seconds)
 {
-    const time_t time = seconds;
-    tm local{};
-    char text[32] = "";
-    if (localtime_r(&time, &local) && strftime(text, sizeof(text), "%a %b %d %H:%M:%S %Z %Y", &local) == 0)
+    tm local;
+    char text[32];
+    if (!localTime(seconds, local) || strftime(text, sizeof(text), "%a %b %d %H:%M:%S %Z %Y", &local) == 0)
         text[0] = '\0';
     return add(label, static_cast<const char *>(text));
 }

@@ -3,6 +3,7 @@
 
 #include "iscsiwebapi/ISCSIExport.h"
 #include "iscsiwebapi/ISCSILUNInfo.h"
+#include "iscsiwebapi/ISCSISnapshotInfo.h"
 
 #include <set>
 #include <string>
@@ -58,6 +59,63 @@ public:
 
     /// ISCSILUNInfo::ListLUN.
     static int ListLUN(std::vector<ISCSILUNInfo> &out, int filter);
+
+    // Snapshots. Taking, restoring and cloning start a platform action and return; a detached worker
+    // waits for its end and does the follow-up work, whose failures reach only the log. The lock state
+    // of the LUN tells when it is over. ERR_FAILED_TO_FORK leaves the action running.
+
+    /// Takes a snapshot. An empty `name` lets the platform choose one, an empty `taken_by` is
+    /// "webapi"; `snapshot_time` is in seconds since the epoch. The outputs are set as soon as the
+    /// snapshot exists. The worker runs the LUN's retention policy.
+    int takeSnapshot(bool is_app_consistent, bool is_user_locked, const std::string &name,
+                     const std::string &description, const std::string &taken_by, long snapshot_time, bool is_scheduled,
+                     std::string &snapshot_uuid, int &snapshot_id);
+
+    /// Deletes a snapshot on behalf of `deleted_by` (empty: "webapi").
+    int deleteSnapshot(const std::string &uuid, const std::string &deleted_by);
+
+    /// ISCSISnapshotInfo::ListSnapshot of this LUN, or of every LUN when none is selected.
+    int listSnapshot(std::vector<ISCSISnapshotInfo> &out, int filter);
+
+    /// Sets the LUN back to a snapshot; the end is also written to the system event log.
+    int restoreSnapshot(const std::string &uuid);
+
+    /// Stops the action that holds both the snapshot and the LUN; nothing to stop is success.
+    int stopSnapshot(const std::string &uuid);
+
+    /// Puts a snapshot's data into the running iSCSI service, read-only, or takes it out;
+    /// `is_for_trash` wins over `is_for_unsync_size`.
+    int loadSnapshot(const std::string &uuid, bool is_for_trash, bool is_for_unsync_size);
+    int unloadSnapshot(const std::string &uuid, bool is_for_trash, bool is_for_unsync_size);
+
+    /// Makes a new LUN beside this one from a snapshot. `new_lun_uuid` is set as soon as the platform
+    /// has accepted the clone; its start and end are written to the system event log.
+    int cloneSnapshot(const std::string &snapshot_uuid, const std::string &new_lun_name, std::string &new_lun_uuid);
+
+    /// Makes a new LUN from this one as it is now, and returns when it is complete. Extent-pool LUNs
+    /// only, else ERR_BAD_LUN_TYPE.
+    int localClone(const std::string &new_lun_name, std::string &new_lun_uuid);
+
+    /// Starts the export of a snapshot into a directory; ISCSISnapshotInfo::getExportProgress follows it.
+    int exportLUN(const std::string &snapshot_uuid, const std::string &destination);
+
+    /// Stops a running export and returns when it has stopped.
+    int exportCancel(const std::string &snapshot_uuid);
+
+    /// Starts the import of an export directory into this LUN. When it has succeeded, the worker takes
+    /// a snapshot that carries the exported one's note, author, time and flags.
+    int importLUN(const std::string &source);
+
+    /// Stops a running import and returns when it has stopped.
+    int importCancel();
+
+    /// Progress of a running import in bytes; with none running, zeros and `step`
+    /// ERR_NOW_IS_NOT_IMPORTING. ERR_FAILED_TO_GET_FILE_SESSION for an unreadable progress file, with
+    /// the outputs before the unreadable one set.
+    int getImportProgress(unsigned long long &done_bytes, unsigned long long &total_bytes, int &step);
+
+    /// ISCSILUNInfo::loadSyncProgress.
+    int getSyncProgress(unsigned long long &done, unsigned long long &total);
 };
 
 } // namespace ISCSI::LIB::LIBLUN
