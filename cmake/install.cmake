@@ -2,25 +2,25 @@
 include(CMakePackageConfigHelpers)
 set(package_dir ${CMAKE_INSTALL_LIBDIR}/cmake/iscsiwebapi)
 
-add_custom_target(product)
-function(install_product destination)
+add_custom_target(product DEPENDS iscsiwebapi)
+function(install_programs destination)
     foreach(target ${ARGN})
         if(TARGET ${target})
-            install(TARGETS ${target} RUNTIME DESTINATION ${destination} LIBRARY DESTINATION ${destination})
+            install(TARGETS ${target} RUNTIME DESTINATION ${destination})
             add_dependencies(product ${target})
         endif()
     endforeach()
 endfunction()
 
-if(ISCSIWEBAPI_PLATFORM STREQUAL "host")
-    install_product(${CMAKE_INSTALL_LIBDIR} norvhost)
-    install_product(${CMAKE_INSTALL_BINDIR} iscsictl)
-    install_product(${CMAKE_INSTALL_SBINDIR} iscsi-host iscsi-portald)
-    install_product(norv/sbin epck) # with the prefix /usr where the library looks for it
+install(TARGETS iscsiwebapi EXPORT iscsiwebapi LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR})
+if(TARGET norvhost)
+    # Exported because programs that link libiscsiwebapi.so must find it; nobody links it by name.
+    install(TARGETS norvhost EXPORT iscsiwebapi LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR} NAMELINK_SKIP)
+    install_programs(${CMAKE_INSTALL_BINDIR} iscsictl)
+    install_programs(${CMAKE_INSTALL_SBINDIR} iscsi-host iscsi-portald)
+    install_programs(norv/sbin epck) # below the prefix /usr this is where the library looks for it
 endif()
 
-install(TARGETS iscsiwebapi EXPORT iscsiwebapi LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR})
-add_dependencies(product iscsiwebapi)
 target_include_directories(iscsiwebapi INTERFACE
     $<INSTALL_INTERFACE:${CMAKE_INSTALL_INCLUDEDIR}>
     $<INSTALL_INTERFACE:${CMAKE_INSTALL_INCLUDEDIR}/iscsiwebapi>)
