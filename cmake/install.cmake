@@ -7,11 +7,15 @@ function(install_programs destination)
     foreach(target ${ARGN})
         if(TARGET ${target})
             install(TARGETS ${target} RUNTIME DESTINATION ${destination})
+            file(RELATIVE_PATH to_libraries /prefix/${destination} /prefix/${CMAKE_INSTALL_LIBDIR})
+            set_target_properties(${target} PROPERTIES INSTALL_RPATH "$ORIGIN/${to_libraries}")
             add_dependencies(product ${target})
         endif()
     endforeach()
 endfunction()
 
+# An installed tree finds its own libraries, wherever it lies; a package build sets CMAKE_SKIP_INSTALL_RPATH.
+set_target_properties(iscsiwebapi PROPERTIES INSTALL_RPATH "$ORIGIN")
 install(TARGETS iscsiwebapi EXPORT iscsiwebapi LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR})
 if(TARGET norvhost)
     # Exported because programs that link libiscsiwebapi.so must find it; nobody links it by name.
