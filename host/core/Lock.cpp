@@ -57,6 +57,24 @@ int askLock(int lid, FileDescriptor &file, bool &held)
     return 0;
 }
 
+/// Leaves `file` empty when another holds the lock and the command does not wait.
+int lockNamed(const std::string &name, int command, FileDescriptor &file)
+{
+    const std::string path = lockFolder() + "/" + name;
+    FileDescriptor opened;
+    if (int err = openLockFile(path, opened))
+        return err;
+    struct flock lock = wholeFile(F_WRLCK);
+    while (fcntl(opened.get(), command, &lock) != 0) {
+        if (command == F_OFD_SETLK && (errno == EAGAIN || errno == EACCES))
+            return 0;
+        if (errno != EINTR)
+            return failErrno(NORV_ERR_LOCK_FILE, errno, "cannot lock %s", path.c_str());
+    }
+    file = std::move(opened);
+    return 0;
+}
+
 } // namespace
 
 int LunLock::take(int lid, int state)
@@ -110,16 +128,12 @@ int lunLockAction(int lid, LunAction &action)
 
 int NamedLock::take(const std::string &name)
 {
-    const std::string path = lockFolder() + "/" + name;
-    FileDescriptor opened;
-    if (int err = openLockFile(path, opened))
-        return err;
-    struct flock lock = wholeFile(F_WRLCK);
-    while (fcntl(opened.get(), F_OFD_SETLKW, &lock) != 0)
-        if (errno != EINTR)
-            return failErrno(NORV_ERR_LOCK_FILE, errno, "cannot lock %s", path.c_str());
-    file = std::move(opened);
-    return 0;
+    return lockNamed(name, F_OFD_SETLKW, file);
+}
+
+int NamedLock::tryTake(const std::string &name)
+{
+    return lockNamed(name, F_OFD_SETLK, file);
 }
 
 } // namespace norvhost

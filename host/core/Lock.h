@@ -39,10 +39,15 @@ private:
 int lunLockHeld(int lid, bool &held);
 int lunLockAction(int lid, LunAction &action);
 
-/// The lock of that name in the run folder, held until the object ends; take() waits for it.
+/// The lock of that name in the run folder, held until the object ends.
 class NamedLock {
 public:
+    /// Waits for it.
     int take(const std::string &name);
+    /// Does not wait: 0 also when another holds it, which held() tells.
+    int tryTake(const std::string &name);
+
+    bool held() const { return static_cast<bool>(file); }
 
 private:
     FileDescriptor file;
