@@ -34,7 +34,7 @@ public:
     /// Only while no child is running.
     void clear()
     {
-        memset(entries, 0, std::min<size_t>(header->used, CAPACITY));
+        memset(entries, 0, static_cast<size_t>(std::min<uint64_t>(header->used, CAPACITY)));
         header->used = 0;
         header->count = 0;
     }

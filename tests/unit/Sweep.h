@@ -14,22 +14,40 @@ namespace unit {
 /// What one run of an operation showed.
 struct Outcome {
     int code;
-    std::string info;    ///< text of the record acted on, for {info}
-    std::string outputs; ///< output arguments, as text
+    std::string info = {};    ///< text of the record acted on, for {info}
+    std::string outputs = {}; ///< output arguments, as text
 };
 
 /// What must be seen when a call fails. In the log lines {info} stands for the text of the record,
 /// {err} for the failing call's code with its text, {code} and {text} for either alone.
 struct Failure {
-    const char *call; ///< the function, or "function#2" for its second call alone
+    std::string call; ///< the function, or "function#2" for its second call alone
     int code;         ///< INJECTED: the failing call's own
     Lines lines;
-    enum {
-        STOPS,
-        CONTINUES
-    } then = STOPS;           ///< whether the operation makes further platform calls
+    bool goes_on = false;     ///< to further platform calls
     std::string outputs = {}; ///< when other than the operation's `untouched`
+
+    Failure leaving(const std::string &other_outputs) const
+    {
+        Failure failure = *this;
+        failure.outputs = other_outputs;
+        return failure;
+    }
 };
+
+/// The failing call is the operation's last, and this is its code and its log lines.
+template <class... Texts>
+Failure stops(const std::string &call, int code, const Texts &...lines)
+{
+    return {call, code, {lines...}};
+}
+
+/// The operation goes on, and succeeds.
+template <class... Texts>
+Failure goesOn(const std::string &call, const Texts &...lines)
+{
+    return {call, 0, {lines...}, true};
+}
 
 struct Operation {
     std::string name; ///< letters and digits
@@ -38,6 +56,13 @@ struct Operation {
     std::string untouched; ///< outputs after a failure
     std::vector<Failure> failures;
 };
+
+template <class... Failures>
+Operation operation(const char *name, void (*set_up)(), std::function<Outcome()> run, const std::string &untouched,
+                    const Failures &...failures)
+{
+    return {name, set_up, run, untouched, {failures...}};
+}
 
 class FailureSweep : public LibraryTest, public testing::WithParamInterface<Operation> {};
 

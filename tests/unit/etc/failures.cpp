@@ -9,11 +9,18 @@ namespace {
 using ISCSI::ISCSILUNInfo;
 using ISCSI::ISCSITargetInfo;
 
-const char *const PATH = "/volume1/@iSCSITrg/iSCSI_3_Extent_vol1_000";
 const std::string UUID = uuidOf(3);
+const std::string LIST_FAILED = "18990557 (Failed to list LUN)";
+const std::string NOT_FOUND = "loadFromConfig: Failed to load LUN info from SDK. LUN UUID: " + UUID;
 
-/// One mapped LUN, everything known about it.
-void lunSet()
+void twoLUNs()
+{
+    addLUN(3, "vol1");
+    addLUN(4, "vol2");
+}
+
+/// A LUN whose every state differs from that of a record not loaded yet.
+void busyLUN()
 {
     auto &lun = addLUN(3, "vol1");
     lun.is_locked = true;
@@ -22,53 +29,96 @@ void lunSet()
     addMapping(5, 3);
 }
 
-void twoLUNs()
+/// The loaders' failures as reported by a method that runs them all, for the n-th LUN that it loads.
+std::vector<Failure> liveState(const std::string &method, int n, int lid, const std::string &map_file)
 {
-    lunSet();
-    addLUN(4, "vol2").map_file.mapped_size = 1;
-}
-
-std::string text(bool value)
-{
-    return value ? "true" : "false";
-}
-
-/// Runs a loader on a record that holds no LUN yet; the record loaded into is the output.
-Operation loader(const char *name, int (ISCSILUNInfo::*load)(_tag_iscsi_lun_ &), std::vector<Failure> failures)
-{
-    const auto live = [](const ISCSILUNInfo &lun) {
-        return text(lun.is_action_locked) + text(lun.is_mapped) + std::to_string(lun.extent_size) + " " +
-               std::to_string(lun.allocated_size) + lun.status;
+    const std::string nth = "#" + std::to_string(n);
+    return {
+        stops("NORViSCSILunIsLocked" + nth, INJECTED,
+              "loadIsActionLocked: Failed to check if LUN is locked. err: {text}, info: {info}",
+              standard(method, "Failed to check if LUN is locked")),
+        stops("NORViSCSIConfGet" + nth, 18990557,
+              "loadIsMapped: Failed to list LUN's mapping targets. LUN ID: " + std::to_string(lid),
+              standard(method, "Failed to check if LUN is mapped", LIST_FAILED)),
+        stops("NORVExtentPoolMapFileMappedSizeGet" + nth, INJECTED,
+              "loadAllocatedSize: Failed to get mapped size from " + map_file,
+              standard(method, "Failed to load LUN's allocate size")),
     };
-    const auto run = [load, live] {
+}
+
+Operation loadEverything(const char *name, int quiet, const Failure &not_found)
+{
+    const auto run = [quiet] {
+        ISCSILUNInfo lun(UUID);
+        _tag_iscsi_lun_ record{};
+        const int code = lun.loadFromConfig(record, 62 | quiet);
+        return Outcome{code, lun.toString()};
+    };
+    auto result = operation(name, busyLUN, run, "", not_found, stops("NLIBCExec", 0), goesOn("NORViSCSILunProgressGet"),
+                            stops("NORViSCSIFamilyConfGetByLID", 0));
+    for (const auto &failure : liveState("loadFromConfig", 1, 3, "/volume1/@iSCSITrg/iSCSI_3_Extent_vol1_000"))
+        result.failures.push_back(failure);
+    return result;
+}
+
+/// After a failure the list holds the LUNs before the failing one.
+Operation listLUNs()
+{
+    const auto run = [] {
+        std::vector<ISCSILUNInfo> luns{ISCSILUNInfo("before")};
+        const int code = ISCSILUNInfo::ListLUN(luns, 62);
+        std::string names = "list:";
+        for (const auto &lun : luns)
+            names += " " + (lun.name.empty() ? lun.uuid : lun.name);
+        return Outcome{code, ISCSILUNInfo(recordOf(luns.empty() ? 3 : 4)).toString(), names};
+    };
+    const std::string all = "list: vol1 vol2";
+    auto result =
+        operation("ListLUN", twoLUNs, run, "list: before",
+                  stops("NORViSCSILunConfigGetAll", 18990557, "ListLUN: Failed to list LUNs' config."),
+                  goesOn("NLIBCExec#1").leaving(all), stops("NLIBCExec#2", 0).leaving(all),
+                  goesOn("NORViSCSILunProgressGet").leaving(all), goesOn("NORViSCSIFamilyConfGetByLID#1").leaving(all),
+                  stops("NORViSCSIFamilyConfGetByLID#2", 0).leaving(all));
+    for (const auto &failure : liveState("ListLUN", 1, 3, "/volume1/@iSCSITrg/iSCSI_3_Extent_vol1_000"))
+        result.failures.push_back(failure.leaving("list:"));
+    for (const auto &failure : liveState("ListLUN", 2, 4, "/volume1/@iSCSITrg/iSCSI_4_Extent_vol2_000"))
+        result.failures.push_back(failure.leaving("list: vol1"));
+    return result;
+}
+
+/// Runs a loader on a record that holds no LUN yet.
+template <class... Failures>
+Operation loader(const std::string &name, int (ISCSILUNInfo::*load)(_tag_iscsi_lun_ &), const Failures &...failures)
+{
+    const auto run = [load] {
         ISCSILUNInfo lun(0, NORV_LUN_TYPE_NONE, 0, 0, UUID, "", "", false, false, 1, 2, "before");
         _tag_iscsi_lun_ record{};
         const int code = (lun.*load)(record);
-        return Outcome{code, lun.toString(), live(lun)};
+        return Outcome{code, lun.toString(),
+                       testing::PrintToString(std::make_tuple(lun.is_action_locked, lun.is_mapped, lun.extent_size,
+                                                              lun.allocated_size, lun.status))};
     };
-    failures.push_back({"NORViSCSILunConfigGetByUUID",
-                        INJECTED,
-                        {std::string(name) + ": Failed to load LUN info from SDK. LUN UUID: " + UUID}});
-    return {name, lunSet, run, "falsefalse1 2before", failures};
+    return operation(
+        name.c_str(), busyLUN, run, "(false, false, 1, 2, \"before\")",
+        stops("NORViSCSILunConfigGetByUUID", INJECTED, name + ": Failed to load LUN info from SDK. LUN UUID: " + UUID),
+        failures...);
 }
 
-/// Runs a question about the LUN's map file, whose answer on success is not `untouched`.
-template <class Answer>
-Operation question(const char *name, int (ISCSILUNInfo::*ask)(Answer &), Answer untouched,
-                   std::vector<Failure> failures)
+/// Asks about the LUN's map file; the answer is other than `untouched`.
+template <class Answer, class... Failures>
+Operation question(const std::string &name, int (ISCSILUNInfo::*ask)(Answer &), Answer untouched,
+                   const Failures &...failures)
 {
-    const auto shown = [](const Answer &answer) { return testing::PrintToString(answer); };
-    const auto run = [ask, untouched, shown] {
+    const auto run = [ask, untouched] {
         ISCSILUNInfo lun(UUID);
         Answer answer = untouched;
         const int code = (lun.*ask)(answer);
-        return Outcome{code, lun.toString(), shown(answer)};
+        return Outcome{code, lun.toString(), testing::PrintToString(answer)};
     };
-    failures.push_back({"NORViSCSILunConfigGetByUUID",
-                        INJECTED,
-                        {"loadFromConfig: Failed to load LUN info from SDK. LUN UUID: " + UUID,
-                         std::string(name) + ": Failed to load LUN info. LUN UUID: " + UUID}});
-    return {name, lunSet, run, shown(untouched), failures};
+    return operation(name.c_str(), busyLUN, run, testing::PrintToString(untouched),
+                     stops("NORViSCSILunConfigGetByUUID", INJECTED, NOT_FOUND,
+                           name + ": Failed to load LUN info. LUN UUID: " + UUID),
+                     failures...);
 }
 
 Outcome syncProgress()
@@ -80,121 +130,31 @@ Outcome syncProgress()
     return {code, lun.toString(), std::to_string(first) + " " + std::to_string(second)};
 }
 
-/// Loading with everything asked for, quietly or not: the loaders' lines, then the record's own.
-Operation loadEverything(const char *name, int quiet, Lines not_found)
-{
-    const auto run = [quiet] {
-        ISCSILUNInfo lun(UUID);
-        _tag_iscsi_lun_ record{};
-        const int code = lun.loadFromConfig(record, 62 | quiet);
-        return Outcome{code, lun.toString(), ""};
-    };
-    return {name,
-            lunSet,
-            run,
-            "",
-            {
-                {"NORViSCSILunConfigGetByUUID", INJECTED, not_found},
-                {"NORViSCSILunIsLocked",
-                 INJECTED,
-                 {"loadIsActionLocked: Failed to check if LUN is locked. err: {text}, info: {info}",
-                  standard("loadFromConfig", "Failed to check if LUN is locked")}},
-                {"NORViSCSIConfGet",
-                 18990557,
-                 {"loadIsMapped: Failed to list LUN's mapping targets. LUN ID: 3",
-                  standard("loadFromConfig", "Failed to check if LUN is mapped", "18990557 (Failed to list LUN)")}},
-                {"NORVExtentPoolMapFileMappedSizeGet",
-                 INJECTED,
-                 {std::string("loadAllocatedSize: Failed to get mapped size from ") + PATH,
-                  standard("loadFromConfig", "Failed to load LUN's allocate size")}},
-                {"NLIBCExec", 0, {}, Failure::STOPS},
-                {"NORViSCSILunProgressGet", 0, {}, Failure::CONTINUES},
-                {"NORViSCSIFamilyConfGetByLID", 0, {}},
-            }};
-}
-
-/// The list names the LUNs that are in it; the first LUN's failures leave it empty, the second's do not.
-Operation listLUNs()
-{
-    const auto run = [] {
-        std::vector<ISCSILUNInfo> luns{ISCSILUNInfo("before")};
-        const int code = ISCSILUNInfo::ListLUN(luns, 62);
-        std::string names = "list:";
-        for (const auto &lun : luns)
-            names += lun.uuid == "before" ? " before" : " " + lun.name;
-        // The failing LUN is the one behind those in the list, with the state loaded before its failure.
-        ISCSILUNInfo failing(recordOf(luns.size() == 1 ? 4 : 3));
-        return Outcome{code, failing.toString(), names};
-    };
-    const auto state = [](const char *call, Lines lines, int code = INJECTED) {
-        return Failure{call, code, lines, Failure::STOPS, call[strlen(call) - 1] == '2' ? "list: vol1" : "list:"};
-    };
-    const std::string unlocked = "info: {info}";
-    return {
-        "ListLUN",
-        [] {
-            twoLUNs();
-            // Live state that leaves the records' texts as they are built.
-            fake::model().luns.at(3).is_locked = false;
-            fake::model().luns.at(3).map_file.mapped_size = 0;
-            fake::model().luns.at(4).map_file.mapped_size = 0;
-            fake::model().mappings.clear();
-        },
-        run,
-        "list: before",
-        {
-            {"NORViSCSILunConfigGetAll", 18990557, {"ListLUN: Failed to list LUNs' config."}},
-            state("NORViSCSILunIsLocked#1",
-                  {"loadIsActionLocked: Failed to check if LUN is locked. err: {text}, info: {info}",
-                   standard("ListLUN", "Failed to check if LUN is locked")}),
-            state("NORViSCSILunIsLocked#2",
-                  {"loadIsActionLocked: Failed to check if LUN is locked. err: {text}, info: {info}",
-                   standard("ListLUN", "Failed to check if LUN is locked")}),
-            state("NORViSCSIConfGet#1",
-                  {"loadIsMapped: Failed to list LUN's mapping targets. LUN ID: 3",
-                   standard("ListLUN", "Failed to check if LUN is mapped", "18990557 (Failed to list LUN)")},
-                  18990557),
-            state("NORViSCSIConfGet#2",
-                  {"loadIsMapped: Failed to list LUN's mapping targets. LUN ID: 4",
-                   standard("ListLUN", "Failed to check if LUN is mapped", "18990557 (Failed to list LUN)")},
-                  18990557),
-            state("NORVExtentPoolMapFileMappedSizeGet#1",
-                  {std::string("loadAllocatedSize: Failed to get mapped size from ") + PATH,
-                   standard("ListLUN", "Failed to load LUN's allocate size")}),
-            state("NORVExtentPoolMapFileMappedSizeGet#2", {"loadAllocatedSize: Failed to get mapped size from "
-                                                           "/volume1/@iSCSITrg/iSCSI_4_Extent_vol2_000",
-                                                           standard("ListLUN", "Failed to load LUN's allocate size")}),
-            {"NLIBCExec#1", 0, {}, Failure::CONTINUES, "list: vol1 vol2"},
-            {"NLIBCExec#2", 0, {}, Failure::STOPS, "list: vol1 vol2"},
-            {"NORViSCSILunProgressGet", 0, {}, Failure::CONTINUES, "list: vol1 vol2"},
-            {"NORViSCSIFamilyConfGetByLID#1", 0, {}, Failure::CONTINUES, "list: vol1 vol2"},
-            {"NORViSCSIFamilyConfGetByLID#2", 0, {}, Failure::STOPS, "list: vol1 vol2"},
-        }};
-}
-
 template <class Key, class Value>
 Operation lookup(const char *name, int (*look)(Key, Value &), std::decay_t<Key> key, Value untouched,
-                 std::vector<Failure> failures)
+                 const Failure &failure)
 {
     const auto run = [look, key, untouched] {
         Value value = untouched;
         const int code = look(key, value);
         return Outcome{code, "", testing::PrintToString(value)};
     };
-    return {name, twoLUNs, run, testing::PrintToString(untouched), failures};
+    const auto set_up = [] {
+        twoLUNs();
+        addTarget(5, "five");
+    };
+    return operation(name, set_up, run, testing::PrintToString(untouched), failure);
 }
 
-Operation listTargets(const char *name, std::string lun_uuid, std::vector<Failure> failures)
+template <class... Failures>
+Operation listTargets(const char *name, const std::string &lun_uuid, const Failures &...failures)
 {
     const auto run = [lun_uuid] {
-        std::vector<ISCSITargetInfo> targets{ISCSITargetInfo("before", "", 0, 0, 0, 0, 0, 0, 0, "", "", "", "")};
+        std::vector<ISCSITargetInfo> targets{ISCSITargetInfo(9)};
         const int code = ISCSITargetInfo::ListTarget(targets, lun_uuid);
-        std::string names = "list:";
-        for (const auto &target : targets)
-            names += " " + target.name;
-        return Outcome{code, ISCSILUNInfo(lun_uuid).toString(), names};
+        return Outcome{code, ISCSILUNInfo(lun_uuid).toString(), std::to_string(targets.size()) + " targets"};
     };
-    return {name, lunSet, run, "list:", failures};
+    return operation(name, busyLUN, run, "0 targets", failures...);
 }
 
 Outcome loadTarget()
@@ -207,88 +167,67 @@ Outcome loadTarget()
 }
 
 const Operation operations[] = {
-    loadEverything("loadFromConfig", 0, {"loadFromConfig: Failed to load LUN info from SDK. LUN UUID: " + UUID}),
-    loadEverything("loadFromConfigQuietly", 1, {}),
-    loader("loadIsActionLocked", &ISCSILUNInfo::loadIsActionLocked,
-           {{"NORViSCSILunIsLocked",
-             INJECTED,
-             {"loadIsActionLocked: Failed to check if LUN is locked. err: {text}, info: {info}"}}}),
-    loader("loadIsMapped", &ISCSILUNInfo::loadIsMapped,
-           {{"NORViSCSIConfGet", 18990557, {"loadIsMapped: Failed to list LUN's mapping targets. LUN ID: 3"}}}),
-    loader("loadExtentSize", &ISCSILUNInfo::loadExtentSize, {}),
-    loader("loadAllocatedSize", &ISCSILUNInfo::loadAllocatedSize,
-           {{"NORVExtentPoolMapFileMappedSizeGet",
-             INJECTED,
-             {std::string("loadAllocatedSize: Failed to get mapped size from ") + PATH}}}),
-    loader("loadStatus", &ISCSILUNInfo::loadStatus,
-           {{"NLIBCExec", 0, {}, Failure::STOPS, "falsefalse1 2unavailabling"},
-            {"NORViSCSILunProgressGet", 0, {}, Failure::CONTINUES, "falsefalse1 2normal"},
-            {"NORViSCSIFamilyConfGetByLID", 0, {}, Failure::STOPS, "falsefalse1 2normal"}}),
-    question("getBaseVersion", &ISCSILUNInfo::getBaseVersion, std::string("before"),
-             {{"NORVExtentPoolMapFileBaseVersionGet",
-               INJECTED,
-               {"getBaseVersion: Failed to get LUN base version. LUN UUID: " + UUID}}}),
-    question("isModified", &ISCSILUNInfo::isModified, false,
-             {{"NORVExtentPoolMapFileVersionInfoGet",
-               INJECTED,
-               {"isModified: Failed to get LUN version info. LUN UUID: " + UUID}}}),
-    question("isSnapshotSentFailed", &ISCSILUNInfo::isSnapshotSentFailed, false,
-             {{"NORVExtentPoolMapFileVersionInfoGet",
-               INJECTED,
-               {"isSnapshotSentFailed: Failed to get LUN's version info. LUN UUID: " + UUID}},
-              {"NORVExtentPoolMapFileTotalCountGet",
-               INJECTED,
-               {"isSnapshotSentFailed: Failed to get LUN's total count. LUN UUID: " + UUID}},
-              {"NORVExtentPoolMapFileSyncedCountGet",
-               INJECTED,
-               {"isSnapshotSentFailed: Failed to get LUN's synced count. LUN UUID: " + UUID}}}),
-    {"loadSyncProgress",
-     lunSet,
-     syncProgress,
-     "77 88",
-     {{"NORViSCSILunConfigGetByUUID",
-       INJECTED,
-       {"loadSyncProgress: Failed to load LUN info from SDK. LUN UUID: " + UUID}},
-      {"NORViSCSIChildLunSyncProgressGet",
-       INJECTED,
-       {standard("loadSyncProgress", "Failed to get LUN sync progress")}}}},
+    loadEverything("loadFromConfig", 0, stops("NORViSCSILunConfigGetByUUID", INJECTED, NOT_FOUND)),
+    loadEverything("loadFromConfigQuietly", 1, stops("NORViSCSILunConfigGetByUUID", INJECTED)),
     listLUNs(),
+    loader("loadIsActionLocked", &ISCSILUNInfo::loadIsActionLocked,
+           stops("NORViSCSILunIsLocked", INJECTED,
+                 "loadIsActionLocked: Failed to check if LUN is locked. err: {text}, info: {info}")),
+    loader("loadIsMapped", &ISCSILUNInfo::loadIsMapped,
+           stops("NORViSCSIConfGet", 18990557, "loadIsMapped: Failed to list LUN's mapping targets. LUN ID: 3")),
+    loader("loadExtentSize", &ISCSILUNInfo::loadExtentSize),
+    loader("loadAllocatedSize", &ISCSILUNInfo::loadAllocatedSize,
+           stops("NORVExtentPoolMapFileMappedSizeGet", INJECTED,
+                 "loadAllocatedSize: Failed to get mapped size from /volume1/@iSCSITrg/iSCSI_3_Extent_vol1_000")),
+    loader("loadStatus", &ISCSILUNInfo::loadStatus,
+           stops("NLIBCExec", 0).leaving("(false, false, 1, 2, \"unavailabling\")"),
+           goesOn("NORViSCSILunProgressGet").leaving("(false, false, 1, 2, \"normal\")"),
+           stops("NORViSCSIFamilyConfGetByLID", 0).leaving("(false, false, 1, 2, \"normal\")")),
+    question("getBaseVersion", &ISCSILUNInfo::getBaseVersion, std::string("before"),
+             stops("NORVExtentPoolMapFileBaseVersionGet", INJECTED,
+                   "getBaseVersion: Failed to get LUN base version. LUN UUID: " + UUID)),
+    question("isModified", &ISCSILUNInfo::isModified, false,
+             stops("NORVExtentPoolMapFileVersionInfoGet", INJECTED,
+                   "isModified: Failed to get LUN version info. LUN UUID: " + UUID)),
+    question("isSnapshotSentFailed", &ISCSILUNInfo::isSnapshotSentFailed, false,
+             stops("NORVExtentPoolMapFileVersionInfoGet", INJECTED,
+                   "isSnapshotSentFailed: Failed to get LUN's version info. LUN UUID: " + UUID),
+             stops("NORVExtentPoolMapFileTotalCountGet", INJECTED,
+                   "isSnapshotSentFailed: Failed to get LUN's total count. LUN UUID: " + UUID),
+             stops("NORVExtentPoolMapFileSyncedCountGet", INJECTED,
+                   "isSnapshotSentFailed: Failed to get LUN's synced count. LUN UUID: " + UUID)),
+    operation("loadSyncProgress", busyLUN, syncProgress, "77 88",
+              stops("NORViSCSILunConfigGetByUUID", INJECTED,
+                    "loadSyncProgress: Failed to load LUN info from SDK. LUN UUID: " + UUID),
+              stops("NORViSCSIChildLunSyncProgressGet", INJECTED,
+                    standard("loadSyncProgress", "Failed to get LUN sync progress"))),
     lookup("GetUUIDByLID", &ISCSILUNInfo::GetUUIDByLID, 3, std::string("before"),
-           {{"NORViSCSILunGetByLunId", 18990531, {"GetUUIDByLID: No such LUN. LUN ID: 3"}}}),
+           stops("NORViSCSILunGetByLunId", 18990531, "GetUUIDByLID: No such LUN. LUN ID: 3")),
     lookup("GetUUIDByLUNName", &ISCSILUNInfo::GetUUIDByLUNName, "vol1", std::string("before"),
-           {{"NORViSCSILunGetByLunName", 18990531, {"GetUUIDByLUNName: No such LUN. Name: vol1"}}}),
+           stops("NORViSCSILunGetByLunName", 18990531, "GetUUIDByLUNName: No such LUN. Name: vol1")),
     lookup("GetLIDByLUNName", &ISCSILUNInfo::GetLIDByLUNName, "vol1", -5,
-           {{"NORViSCSILunGetByLunName", 18990531, {"GetLIDByLUNName: No such LUN. Name: vol1"}}}),
+           stops("NORViSCSILunGetByLunName", 18990531, "GetLIDByLUNName: No such LUN. Name: vol1")),
     lookup(
         "GetLUNUUIDByIndex", &ISCSILUNInfo::GetLUNUUID, "lun#2", std::string("before"),
-        {{"NORViSCSILunConfigGetAll", 18990557, {"ListLUN: Failed to list LUNs' config.", ": Failed to list LUNs."}}}),
+        stops("NORViSCSILunConfigGetAll", 18990557, "ListLUN: Failed to list LUNs' config.", ": Failed to list LUNs.")),
     lookup("GetLUNUUIDByName", &ISCSILUNInfo::GetLUNUUID, "vol1", std::string("before"),
-           {{"NORViSCSILunGetByLunName",
-             18990505,
-             {"GetUUIDByLUNName: No such LUN. Name: vol1", ": Invalid LUN UUID, name or index. input: vol1"}}}),
-    {"TargetLoadFromConfig",
-     lunSet,
-     loadTarget,
-     "before 0",
-     {{"NORViSCSIConfGet", 18990722, {"loadFromConfig: Failed to load target info. target ID: 5"}}}},
-    listTargets("ListTarget", "", {{"NORViSCSIConfGet", 18990721, {"ListTarget: Failed to list target. LUN UUID: "}}}),
-    listTargets("ListTargetOfLUN", UUID,
-                {{"NORViSCSILunConfigGetByUUID",
-                  INJECTED,
-                  {"loadFromConfig: Failed to load LUN info from SDK. LUN UUID: " + UUID,
-                   "ListTarget: Failed to load LUN info: {info}"}},
-                 {"NORViSCSIConfGet", 18990721, {"ListTarget: Failed to list target. LUN UUID: " + UUID}}}),
+           stops("NORViSCSILunGetByLunName", 18990505, "GetUUIDByLUNName: No such LUN. Name: vol1",
+                 ": Invalid LUN UUID, name or index. input: vol1")),
+    operation("TargetLoadFromConfig", busyLUN, loadTarget, "before 0",
+              stops("NORViSCSIConfGet", 18990722, "loadFromConfig: Failed to load target info. target ID: 5")),
+    listTargets("ListTarget", "", stops("NORViSCSIConfGet", 18990721, "ListTarget: Failed to list target. LUN UUID: ")),
+    listTargets(
+        "ListTargetOfLUN", UUID,
+        stops("NORViSCSILunConfigGetByUUID", INJECTED, NOT_FOUND, "ListTarget: Failed to load LUN info: {info}"),
+        stops("NORViSCSIConfGet", 18990721, "ListTarget: Failed to list target. LUN UUID: " + UUID)),
     lookup("GetTIDByTargetName", &ISCSITargetInfo::GetTIDByTargetName, "five", -5,
-           {{"NORViSCSIConfTargetLoad", INJECTED, {"GetTIDByTargetName: Failed to load target config."}}}),
+           stops("NORViSCSIConfTargetLoad", INJECTED, "GetTIDByTargetName: Failed to load target config.")),
     lookup("GetTIDByIndex", &ISCSITargetInfo::GetTID, "tg#1", -5,
-           {{"NORViSCSIConfGet",
-             18990721,
-             {"ListTarget: Failed to list target. LUN UUID: ", ": Failed to list targets."}}}),
-    lookup(
-        "GetTIDByName", &ISCSITargetInfo::GetTID, "five", -5,
-        {{"NORViSCSIConfTargetLoad",
-          18990710,
-          {"GetTIDByTargetName: Failed to load target config.", ": Invalid target ID, name or index. input: five"}}}),
+           stops("NORViSCSIConfGet", 18990721,
+                 "ListTarget: Failed to list target. LUN UUID: ", ": Failed to list targets.")),
+    lookup("GetTIDByName", &ISCSITargetInfo::GetTID, "five", -5,
+           stops("NORViSCSIConfTargetLoad", 18990710, "GetTIDByTargetName: Failed to load target config.",
+                 ": Invalid target ID, name or index. input: five")),
 };
 
 INSTANTIATE_TEST_SUITE_P(Records, FailureSweep, testing::ValuesIn(operations), operationName);

@@ -8,50 +8,41 @@ namespace {
 using ISCSI::LIB::LIBLUN::ISCSILIBLUN;
 
 const std::string UUID = uuidOf(3);
-const std::string NOT_LOADED = "loadFromConfig: Failed to load LUN info from SDK. LUN UUID: " + UUID;
-const std::string LUN_ERROR = "18990557 (Failed to list LUN)";
 
-/// A mapped extent-pool LUN with a snapshot task, a scheduled-snapshot task and a retention policy.
-void lunSet()
+void mappedLUN()
 {
     addLUN(3, "vol1").is_locked = true;
-    addTarget(5, "five");
-    addTarget(6, "six");
-    addMapping(5, 3);
-    addMapping(6, 3);
+    for (int tid : {5, 6}) {
+        addTarget(tid, "t" + std::to_string(tid));
+        addMapping(tid, 3);
+    }
 }
 
-void lunToDelete()
+void scheduledLUN()
 {
     addLUN(3, "vol1");
     fake::model().jobs = {{11, {"vol1", 0}}, {12, {"", 3}}};
-    fake::model().retention_policies = {{"Lun#", "3"}};
 }
 
-/// Runs `act` on the LUN; `act` returns the code and may show outputs.
-template <class Act>
-std::function<Outcome()> onLUN(Act act)
+/// Runs `act` on the LUN; the flag that it may set is the output.
+template <class... Failures>
+Operation onLUN(const char *name, void (*set_up)(), int (*act)(ISCSILIBLUN &, bool &), const Failures &...failures)
 {
-    return [act] {
+    const auto run = [act] {
         ISCSILIBLUN lun(UUID);
-        std::string outputs;
-        const int code = act(lun, outputs);
-        return Outcome{code, lun.info.toString(), outputs};
+        bool flag = false;
+        const int code = act(lun, flag);
+        return Outcome{code, lun.info.toString(), testing::PrintToString(flag)};
     };
+    return operation(name, set_up, run, "false", failures...);
 }
 
-/// What a failing load of the LUN looks like to an operation in the standard form.
-Failure notLoaded(const std::string &method)
+/// The LUN cannot be loaded; `rest` is how the method words it.
+Failure notLoaded(const std::string &method, const std::string &rest = "Failed to load LUN config.")
 {
-    return {"NORViSCSILunConfigGetByUUID", INJECTED, {NOT_LOADED, standard(method, "Failed to load LUN config")}};
-}
-
-/// The same for those that word it differently.
-Failure notLoadedFromSDK(const std::string &method)
-{
-    return {"NORViSCSILunConfigGetByUUID",
-            INJECTED,
-            {NOT_LOADED, method + ": Failed to load LUN info from SDK info: {info}. error: {err}"}};
+    return stops("NORViSCSILunConfigGetByUUID", INJECTED,
+                 "loadFromConfig: Failed to load LUN info from SDK. LUN UUID: " + UUID,
+                 method + ": " + rest + " info: {info}. error: {err}");
 }
 
 Outcome create()
@@ -61,105 +52,62 @@ Outcome create()
     return {code, lun.info.toString(), lun.info.uuid + std::to_string(lun.info.lun_id)};
 }
 
-Failure deleteGoesOn(const char *call, Lines lines = {})
+Outcome list()
 {
-    return {call, 0, lines, Failure::CONTINUES};
+    std::vector<ISCSI::ISCSILUNInfo> luns(5);
+    const int code = ISCSILIBLUN::ListLUN(luns, 0);
+    return {code, "", std::to_string(luns.size())};
 }
 
 const Operation operations[] = {
-    {"loadLUNInfo",
-     lunSet,
-     onLUN([](auto &lun, auto &) { return lun.loadLUNInfo(0); }),
-     "",
-     {notLoaded("loadLUNInfo")}},
-    {"createLUN",
-     lunSet,
-     create,
-     "0",
-     {{"NORViSCSILunCreate", INJECTED, {standard("createLUN", "Failed to create LUN")}}}},
-    {"deleteLUN",
-     lunToDelete,
-     onLUN([](auto &lun, auto &) { return lun.deleteLUN(); }),
-     "",
-     {notLoaded("deleteLUN"),
-      deleteGoesOn("NORViSCSILunTaskGetSchIDByName"),
-      deleteGoesOn("NORVSchedTaskRemove#1", {": NORVSchedTaskRemove() fail, schedule id = 11"}),
-      deleteGoesOn("ScheduleSnapshotTaskGetIDByLid"),
-      deleteGoesOn("NORVSchedTaskRemove#2", {": NORVSchedTaskRemove() fail, schedule id = 12"}),
-      deleteGoesOn("NORVRETENTIONRemovePolicy"),
-      {"NORViSCSILunDelete", 18990551, {"deleteLUN: Failed to delete LUN: {info}. error code: {code}"}}}},
-    {"isLUNLocked",
-     lunSet,
-     onLUN([](auto &lun, auto &outputs) {
-         bool out = false;
-         const int code = lun.isLUNLocked(out);
-         outputs = out ? "locked" : "untouched";
-         return code;
-     }),
-     "untouched",
-     {notLoadedFromSDK("isLUNLocked"),
-      {"NORViSCSILunIsLocked", INJECTED, {standard("isLUNLocked", "Failed to check if LUN is locked")}}}},
-    {"isLUNMapped",
-     lunSet,
-     onLUN([](auto &lun, auto &outputs) {
-         bool out = false;
-         const int code = lun.isLUNMapped(out);
-         outputs = out ? "mapped" : "untouched";
-         return code;
-     }),
-     "untouched",
-     {notLoaded("isLUNMapped"),
-      {"NORViSCSIConfGet", 18990557, {standard("isLUNMapped", "Failed to list LUN's mapping targets", LUN_ERROR)}}}},
-    {"loadLUN",
-     lunSet,
-     onLUN([](auto &lun, auto &) { return lun.loadLUN(true, false); }),
-     "",
-     {notLoaded("loadLUN"),
-      {"NORViSCSILunLoad",
-       INJECTED,
-       {"loadLUN: Failed to load LUN. is_for_trash: true, is_for_unsync_size: false info: {info}. error: {err}"}}}},
-    {"unloadLUN",
-     lunSet,
-     onLUN([](auto &lun, auto &) { return lun.unloadLUN(false, true); }),
-     "",
-     {notLoaded("unloadLUN"),
-      {"NORViSCSILunUnload",
-       INJECTED,
-       {"unloadLUN: Failed to unload LUN. is_for_trash: false, is_for_unsync_size: true info: {info}. error: {err}"}}}},
-    {"updateLUN",
-     [] { addLUN(3, "vol1"); },
-     onLUN([](auto &lun, auto &) { return lun.updateLUN("new", 2 * GIB); }),
-     "",
-     {notLoadedFromSDK("updateLUN"),
-      {"NORViSCSILunIsNameExist", INJECTED, {standard("updateLUN", "Failed to query if the LUN name exists")}},
-      {"NORViSCSILunUpdate", INJECTED, {standard("updateLUN", "Failed to update LUN")}}}},
-    {"LIBLUNListLUN",
-     lunSet,
-     [] {
-         std::vector<ISCSI::ISCSILUNInfo> luns(5);
-         const int code = ISCSILIBLUN::ListLUN(luns, 0);
-         return Outcome{code, "", std::to_string(luns.size())};
-     },
-     "5",
-     {{"NORViSCSILunConfigGetAll", 18990557, {"ListLUN: Failed to list LUNs' config."}}}},
-    {"mapTarget",
-     lunSet,
-     onLUN([](auto &lun, auto &) {
-         return lun.mapTarget({6, 5});
-     }),
-     "",
-     {notLoaded("mapTarget"),
-      {"NORViSCSILunMappingsAdd",
-       18990570,
-       {"mapTarget: Failed to add mappings. targets: 5 6. info: {info}. error: {err}"}}}},
-    {"unmapTarget",
-     lunSet,
-     onLUN([](auto &lun, auto &) { return lun.unmapTarget({5}); }),
-     "",
-     {notLoaded("unmapTarget"),
-      {"NORViSCSILunMappingsRemove",
-       18990710,
-       {"unmapTarget: Failed to remove mappings. targets: 5. info: {info}. error: {err}"}}}},
+    operation("createLUN", mappedLUN, create, "0",
+              stops("NORViSCSILunCreate", INJECTED, standard("createLUN", "Failed to create LUN"))),
+    operation("LIBLUNListLUN", mappedLUN, list, "5",
+              stops("NORViSCSILunConfigGetAll", 18990557, "ListLUN: Failed to list LUNs' config.")),
+    onLUN(
+        "loadLUNInfo", mappedLUN, [](auto &lun, bool &) { return lun.loadLUNInfo(0); }, notLoaded("loadLUNInfo")),
+    onLUN(
+        "deleteLUN", scheduledLUN, [](auto &lun, bool &) { return lun.deleteLUN(); }, notLoaded("deleteLUN"),
+        goesOn("NORViSCSILunTaskGetSchIDByName"),
+        goesOn("NORVSchedTaskRemove#1", ": NORVSchedTaskRemove() fail, schedule id = 11"),
+        goesOn("ScheduleSnapshotTaskGetIDByLid"),
+        goesOn("NORVSchedTaskRemove#2", ": NORVSchedTaskRemove() fail, schedule id = 12"),
+        goesOn("NORVRETENTIONRemovePolicy"),
+        stops("NORViSCSILunDelete", 18990551, "deleteLUN: Failed to delete LUN: {info}. error code: {code}")),
+    onLUN(
+        "isLUNLocked", mappedLUN, [](auto &lun, bool &out) { return lun.isLUNLocked(out); },
+        notLoaded("isLUNLocked", "Failed to load LUN info from SDK"),
+        stops("NORViSCSILunIsLocked", INJECTED, standard("isLUNLocked", "Failed to check if LUN is locked"))),
+    onLUN(
+        "isLUNMapped", mappedLUN, [](auto &lun, bool &out) { return lun.isLUNMapped(out); }, notLoaded("isLUNMapped"),
+        stops("NORViSCSIConfGet", 18990557,
+              standard("isLUNMapped", "Failed to list LUN's mapping targets", "18990557 (Failed to list LUN)"))),
+    onLUN(
+        "loadLUN", mappedLUN, [](auto &lun, bool &) { return lun.loadLUN(true, false); }, notLoaded("loadLUN"),
+        stops("NORViSCSILunLoad", INJECTED,
+              "loadLUN: Failed to load LUN. is_for_trash: true, is_for_unsync_size: false info: {info}. error: {err}")),
+    onLUN(
+        "unloadLUN", mappedLUN, [](auto &lun, bool &) { return lun.unloadLUN(false, true); }, notLoaded("unloadLUN"),
+        stops("NORViSCSILunUnload", INJECTED,
+              "unloadLUN: Failed to unload LUN. is_for_trash: false, is_for_unsync_size: true"
+              " info: {info}. error: {err}")),
+    onLUN(
+        "updateLUN", [] { addLUN(3, "vol1"); }, [](auto &lun, bool &) { return lun.updateLUN("new", 2 * GIB); },
+        notLoaded("updateLUN", "Failed to load LUN info from SDK"),
+        stops("NORViSCSILunIsNameExist", INJECTED, standard("updateLUN", "Failed to query if the LUN name exists")),
+        stops("NORViSCSILunUpdate", INJECTED, standard("updateLUN", "Failed to update LUN"))),
+    onLUN(
+        "mapTarget", mappedLUN,
+        [](auto &lun, bool &) {
+            return lun.mapTarget({6, 5});
+        },
+        notLoaded("mapTarget"),
+        stops("NORViSCSILunMappingsAdd", 18990570,
+              "mapTarget: Failed to add mappings. targets: 5 6. info: {info}. error: {err}")),
+    onLUN(
+        "unmapTarget", mappedLUN, [](auto &lun, bool &) { return lun.unmapTarget({5}); }, notLoaded("unmapTarget"),
+        stops("NORViSCSILunMappingsRemove", 18990710,
+              "unmapTarget: Failed to remove mappings. targets: 5. info: {info}. error: {err}")),
 };
 
 INSTANTIATE_TEST_SUITE_P(LUNOperations, FailureSweep, testing::ValuesIn(operations), operationName);

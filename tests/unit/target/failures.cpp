@@ -6,7 +6,6 @@ namespace unit {
 namespace {
 
 using ISCSI::LIB::LIBTarget::ISCSILIBTarget;
-using Masking = std::map<std::string, ISCSI_TARGET_AUTHORITY>;
 
 Outcome create()
 {
@@ -20,7 +19,7 @@ Outcome remove()
 {
     ISCSILIBTarget target(5);
     const int code = target.deleteTarget();
-    return {code, target.info.toString(), ""};
+    return {code, target.info.toString()};
 }
 
 void maskedTarget()
@@ -30,74 +29,49 @@ void maskedTarget()
 
 Outcome getMasking()
 {
-    Masking masking = {{"before", NORV_AUTHORITY_READ}};
+    std::map<std::string, ISCSI_TARGET_AUTHORITY> masking = {{"before", NORV_AUTHORITY_READ}};
     const int code = ISCSILIBTarget::GetTargetMasking(5, masking);
     return {code, "", masking.begin()->first};
 }
 
-/// The outputs are the masking itself: what was applied before the failure stays.
+/// The output is the masking itself: what was applied before the failure stays.
 Outcome setMasking()
 {
     const int code = ISCSILIBTarget::ACLMasksSet(5, parsed(R"([{"iqn": "iqn.new", "permission": "rw"},
         {"iqn": "iqn.keep", "permission": "r"}, {"iqn": "iqn.change", "permission": "-"}])"));
     std::string masking;
     for (const auto &[iqn, permission] : fake::model().targets.at(5).masking)
-        masking += (masking.empty() ? "" : " ") + iqn + "=" + std::to_string(permission);
+        masking += iqn + "=" + std::to_string(permission) + " ";
     return {code, "", masking};
 }
 
+const Failure no_masking = stops("NORViSCSITargetMaskingGet", INJECTED,
+                                 ": GetTargetMasking(): NORViSCSITargetMaskingGet(5, vACLs) failed, err={text}");
+
 const Operation operations[] = {
-    {"createTarget",
-     [] {},
-     create,
-     "tid 1",
-     {{"NORViSCSITargetCreate",
-       18990714,
-       {"createTarget: Failed to create target. target: {info}"},
-       Failure::STOPS,
-       "tid 0"},
-      {"NORViSCSIDefaultACLSet", 18990715, {"createTarget: Failed to add default masking IQN. target: {info}"}},
-      {"NORViSCSITargetEnable", 18990718, {"createTarget: Failed to enable target. target: {info}"}}}},
-    {"deleteTarget",
-     maskedTarget,
-     remove,
-     "",
-     {{"NORViSCSIConfGet",
-       18990722,
-       {"loadFromConfig: Failed to load target info. target ID: 5",
-        standard("deleteTarget", "Failed to fill ISCSI_TARGET", "18990722 (Failed to load target)")}},
-      {"NORViSCSITargetRemove",
-       18990720,
-       {standard("deleteTarget", "Failed to delete target", "18990720 (Failed to delete target)")}}}},
-    {"GetTargetMasking",
-     maskedTarget,
-     getMasking,
-     "before",
-     {{"NORViSCSITargetMaskingGet",
-       INJECTED,
-       {": GetTargetMasking(): NORViSCSITargetMaskingGet(5, vACLs) failed, err={text}"}}}},
-    {"ACLMasksSet",
-     maskedTarget,
-     setMasking,
-     "iqn.keep=1 iqn.change=1 iqn.drop=3",
-     {{"NORViSCSITargetMaskingGet",
-       INJECTED,
-       {": GetTargetMasking(): NORViSCSITargetMaskingGet(5, vACLs) failed, err={text}"}},
-      {"NORViSCSIMaskingsCreate",
-       18990715,
-       {"[E] ACLMasksSet: error code: 18990715 (Failed to create ACL masking) "
-        "[norvsdk failed to create acl masking]"}},
-      {"NORViSCSIMaskingsUpdate",
-       18990717,
-       {"[E] ACLMasksSet: error code: 18990717 (Failed to update ACL masking) [Failed to update masking]"},
-       Failure::STOPS,
-       "iqn.keep=1 iqn.change=1 iqn.drop=3 iqn.new=3"},
-      {"NORViSCSIMaskingsRemove",
-       18990716,
-       {"[E] ACLMasksSet: error code: 18990716 (Failed to delete ACL masking) "
-        "[norvsdk failed to delete acl masking]"},
-       Failure::STOPS,
-       "iqn.keep=1 iqn.change=0 iqn.drop=3 iqn.new=3"}}},
+    operation(
+        "createTarget", [] {}, create, "tid 1",
+        stops("NORViSCSITargetCreate", 18990714, "createTarget: Failed to create target. target: {info}")
+            .leaving("tid 0"),
+        stops("NORViSCSIDefaultACLSet", 18990715, "createTarget: Failed to add default masking IQN. target: {info}"),
+        stops("NORViSCSITargetEnable", 18990718, "createTarget: Failed to enable target. target: {info}")),
+    operation("deleteTarget", maskedTarget, remove, "",
+              stops("NORViSCSIConfGet", 18990722, "loadFromConfig: Failed to load target info. target ID: 5",
+                    standard("deleteTarget", "Failed to fill ISCSI_TARGET", "18990722 (Failed to load target)")),
+              stops("NORViSCSITargetRemove", 18990720,
+                    standard("deleteTarget", "Failed to delete target", "18990720 (Failed to delete target)"))),
+    operation("GetTargetMasking", maskedTarget, getMasking, "before", no_masking),
+    operation("ACLMasksSet", maskedTarget, setMasking, "iqn.keep=1 iqn.change=1 iqn.drop=3 ", no_masking,
+              stops("NORViSCSIMaskingsCreate", 18990715,
+                    "[E] ACLMasksSet: error code: 18990715 (Failed to create ACL masking) "
+                    "[norvsdk failed to create acl masking]"),
+              stops("NORViSCSIMaskingsUpdate", 18990717,
+                    "[E] ACLMasksSet: error code: 18990717 (Failed to update ACL masking) [Failed to update masking]")
+                  .leaving("iqn.keep=1 iqn.change=1 iqn.drop=3 iqn.new=3 "),
+              stops("NORViSCSIMaskingsRemove", 18990716,
+                    "[E] ACLMasksSet: error code: 18990716 (Failed to delete ACL masking) "
+                    "[norvsdk failed to delete acl masking]")
+                  .leaving("iqn.keep=1 iqn.change=0 iqn.drop=3 iqn.new=3 ")),
 };
 
 INSTANTIATE_TEST_SUITE_P(TargetOperations, FailureSweep, testing::ValuesIn(operations), operationName);
