@@ -90,8 +90,7 @@ int LunLock::take(int lid, int state)
         return failErrno(NORV_ERR_LOCK_FILE, errno, "cannot lock %s", path.c_str());
     }
     file = std::move(opened);
-    action_state = state;
-    tell(-1);
+    become(state);
     return 0;
 }
 
@@ -103,6 +102,12 @@ void LunLock::tell(int percent)
     // Display only: an action does not fail because its progress cannot be told.
     if (pwrite(file.get(), text, static_cast<size_t>(length), 0) != length)
         fail(NORV_ERR_WRITE_FILE, "cannot write an action's progress");
+}
+
+void LunLock::become(int state)
+{
+    action_state = state;
+    tell(-1);
 }
 
 int lunLockHeld(int lid, bool &held)

@@ -24,8 +24,11 @@ public:
     /// another action holds it, else an error code.
     int take(int lid, int state);
 
-    /// Tells how far the action is, 0 to 100.
+    /// Tells how far the action is, 0 to 100; -1 = cannot tell.
     void tell(int percent);
+
+    /// The action goes on as another one.
+    void become(int state);
 
     void release() { file.reset(); }
     bool held() const { return static_cast<bool>(file); }

@@ -18,12 +18,14 @@ CREATE TABLE settings (
     key TEXT PRIMARY KEY,
     value TEXT NOT NULL
 ) STRICT, WITHOUT ROWID;
+-- The store's identity: it marks the data files that belong to this store's rows.
+INSERT INTO settings VALUES ('store', lower(hex(randomblob(16))));
 
--- A volume that was only registered has neither image nor size: somebody else mounts it.
+-- The image is the file that we loop-mount at the path; empty where somebody else mounts it.
 CREATE TABLE volumes (
     path TEXT PRIMARY KEY,
-    image TEXT NOT NULL DEFAULT '',
-    size INTEGER NOT NULL DEFAULT 0
+    mount_point TEXT NOT NULL,
+    image TEXT NOT NULL DEFAULT ''
 ) STRICT, WITHOUT ROWID;
 
 CREATE TABLE luns (
@@ -72,15 +74,14 @@ CREATE TABLE maskings (
     PRIMARY KEY (tid, iqn)
 ) STRICT, WITHOUT ROWID;
 
--- A LUN's jobs; they outlive neither their removal nor the reuse of an ID.
+-- AUTOINCREMENT: the ID of a removed job never comes back as another one's.
 CREATE TABLE schedules (
     id INTEGER PRIMARY KEY AUTOINCREMENT,
     kind TEXT NOT NULL CHECK (kind IN ('backup', 'snapshot')),
-    lid INTEGER NOT NULL,
-    lun_name TEXT NOT NULL,
-    rule TEXT NOT NULL DEFAULT ''
+    lid INTEGER NOT NULL REFERENCES luns ON DELETE CASCADE,
+    rule TEXT NOT NULL,
+    UNIQUE (lid, kind)
 ) STRICT;
-CREATE INDEX schedules_of_lun ON schedules (lid);
 
 CREATE TABLE retention_policies (
     kind TEXT NOT NULL,
