@@ -117,7 +117,8 @@ long answerOf(const char *name, long otherwise)
 bool isName(const std::string &text, size_t longest)
 {
     const auto is_bad = [](unsigned char c) { return c < ' ' || c == 0x7F || c == '/'; };
-    return !text.empty() && text.size() <= longest && std::none_of(text.begin(), text.end(), is_bad);
+    return !text.empty() && text != "." && text != ".." && text.size() <= longest &&
+           std::none_of(text.begin(), text.end(), is_bad);
 }
 
 } // namespace fake

@@ -193,6 +193,8 @@ int NORViSCSILunCreate(_tag_iscsi_lun_ *lun)
     if (lid > NORV_LUN_ID_MAX)
         return NORV_ERR_MAX_LUNS;
     lun->lid = lid;
+    lun->options = 0;
+    lun->restored_time = 0;
     snprintf(lun->uuid, sizeof(lun->uuid), "00000000-0000-4000-8000-%012x", ++model().uuids_made);
     model().luns[lid].record = *lun;
     return 0;
