@@ -16,14 +16,17 @@ namespace ISCSI {
 template <class Value>
 int StringCopy(char *destination, size_t size, const Value &value)
 {
+    // The method is named here, for in a template here() would name its arguments too.
     if (!destination)
-        return failText(here(), ERR_NULL_POINTER, "NULL destination pointer");
+        return failText(here(__builtin_FILE(), __builtin_LINE(), __func__), ERR_NULL_POINTER,
+                        "NULL destination pointer");
     std::ostringstream stream;
     stream << value;
     const std::string text = stream.str();
     const int length = snprintf(destination, size, "%s", text.c_str());
     if (static_cast<size_t>(length) >= size)
-        return failText(here(), ERR_FAILED_TO_COPY_STRING, "Failed to copy string: %s", text.c_str());
+        return failText(here(__builtin_FILE(), __builtin_LINE(), __func__), ERR_FAILED_TO_COPY_STRING,
+                        "Failed to copy string: %s", text.c_str());
     return 0;
 }
 

@@ -34,10 +34,11 @@ bool isIndex(const SelectorKind &kind, const std::string &selector, unsigned int
     char behind = 0;
     if (sscanf(lower.c_str(), kind.index_pattern, &number, &behind) != 1)
         return false;
-    // sscanf lets a number that does not fit wrap around to one that does.
+    // sscanf lets a number that does not fit, or is negative, wrap around to one that does.
     errno = 0;
-    const unsigned long long whole = strtoull(strchr(lower.c_str(), '#') + 1, nullptr, 10);
-    index = errno == ERANGE || whole > UINT_MAX ? UINT_MAX : static_cast<unsigned int>(whole);
+    const long long whole = strtoll(strchr(lower.c_str(), '#') + 1, nullptr, 10);
+    const bool fits = errno == 0 && whole >= 0 && whole <= UINT_MAX;
+    index = fits ? static_cast<unsigned int>(whole) : UINT_MAX;
     return true;
 }
 

@@ -1,0 +1,153 @@
+#include "cli/Commands.h"
+
+#include "cli/Request.h"
+
+namespace cli {
+namespace {
+
+using Words = std::vector<std::string>;
+
+// Both scripts leave everything to "iscsictl __complete", which knows the definitions.
+constexpr char BASH[] = R"(# bash completion for iscsictl
+_iscsictl() {
+    local word=${COMP_WORDS[COMP_CWORD]} quote='' line
+    local -a found=()
+    case $word in
+        [\'\"]*) quote=${word:0:1} word=${word:1} ;;
+        *) word=${word//\\/} ;;
+    esac
+    COMPREPLY=()
+    mapfile -t found < <("${COMP_WORDS[0]}" __complete "${COMP_WORDS[@]:1:COMP_CWORD-1}" "$word" 2>/dev/null)
+    case ${found[0]-} in
+        :FILE) compopt -o filenames && mapfile -t COMPREPLY < <(compgen -f -- "$word") ;;
+        :DIR) compopt -o filenames && mapfile -t COMPREPLY < <(compgen -d -- "$word") ;;
+        *)
+            for line in "${found[@]}"; do
+                [[ -n $quote ]] || printf -v line %q "$line"
+                COMPREPLY+=("$line")
+            done
+            ;;
+    esac
+}
+complete -F _iscsictl iscsictl
+)";
+
+constexpr char ZSH[] = R"(#compdef iscsictl
+# zsh completion for iscsictl
+_iscsictl() {
+    local -a found
+    found=("${(@f)$(${(Q)words[1]} __complete "${(@Q)words[2,CURRENT]}" 2>/dev/null)}")
+    case $found[1] in
+        :FILE) _files ;;
+        :DIR) _files -/ ;;
+        *) compadd -a found ;;
+    esac
+}
+if [[ $funcstack[1] == _iscsictl ]]; then
+    _iscsictl "$@"
+else
+    compdef _iscsictl iscsictl
+fi
+)";
+
+void addNames(Words &found, const char *path)
+{
+    for (const Json::Value &object : request(webapi::Method::Get, path))
+        found.push_back(object["name"].asString());
+}
+
+Words candidatesOf(const CLI::Option &option)
+{
+    const std::string kind = argumentKind(option);
+    Words found;
+    if (kind == "LUN")
+        addNames(found, "/luns");
+    else if (kind == "TARGET")
+        addNames(found, "/targets");
+    else if (kind == "FILE" || kind == "DIR")
+        found.push_back(":" + kind);
+    else if (kind.find('|') != std::string::npos && kind.find('=') == std::string::npos)
+        found = CLI::detail::split(kind, '|');
+    return found;
+}
+
+Words optionNames(const CLI::App &app)
+{
+    Words names;
+    for (const CLI::Option *option : shownOptions(app)) {
+        for (const std::string &name : option->get_lnames())
+            names.push_back("--" + name);
+    }
+    return names;
+}
+
+const CLI::App *subcommand(const CLI::App &app, const std::string &name)
+{
+    const auto found = app.get_subcommands([&](const CLI::App *sub) { return sub->get_name() == name; });
+    return found.empty() ? nullptr : found.front();
+}
+
+/// The option that takes its value from the words after it, among those that are not positional.
+const CLI::Option *valueOption(const CLI::App &app, const std::string &word)
+{
+    const CLI::Option *option = app.get_option_no_throw(word);
+    return option && !option->get_positional() && option->get_items_expected_max() > 0 ? option : nullptr;
+}
+
+Words candidates(const CLI::App &root, const Words &words)
+{
+    const CLI::App *app = &root;
+    const CLI::Option *open = nullptr; // waits for its value
+    size_t positionals = 0;
+    bool only_positionals = false;
+    for (size_t i = 0; i + 1 < words.size(); ++i) {
+        const std::string &word = words[i];
+        if (open) {
+            open = word == "=" ? open : nullptr; // bash makes "--size=1G" three words
+        } else if (word == "--" && !only_positionals) {
+            only_positionals = true;
+        } else if (word.size() > 1 && word[0] == '-' && !only_positionals) {
+            open = valueOption(*app, word);
+        } else if (const CLI::App *sub = positionals == 0 ? subcommand(*app, word) : nullptr) {
+            app = sub;
+        } else {
+            ++positionals;
+        }
+    }
+    const std::string last = words.empty() || words.back() == "=" ? "" : words.back();
+    if (open)
+        return candidatesOf(*open);
+    if (!last.empty() && last[0] == '-' && !only_positionals)
+        return optionNames(*app);
+    Words found;
+    for (const CLI::App *sub : shownSubcommands(*app))
+        found.push_back(sub->get_name());
+    if (!found.empty())
+        return found;
+    for (const CLI::Option *option : shownOptions(*app)) {
+        if (option->get_positional() && (positionals-- == 0 || option->get_items_expected_max() > 1))
+            return candidatesOf(*option);
+    }
+    return {};
+}
+
+} // namespace
+
+void complete(const Words &words)
+{
+    const std::string last = words.empty() || words.back() == "=" ? "" : words.back();
+    std::string text;
+    for (const std::string &found : candidates(makeCommands()->app, words)) {
+        const bool one_line = found.find('\n') == std::string::npos;
+        if (one_line && (found[0] == ':' || found.compare(0, last.size(), last) == 0))
+            text += found + "\n";
+    }
+    print(text);
+}
+
+std::string completionScript(const std::string &shell)
+{
+    return shell == "zsh" ? ZSH : BASH;
+}
+
+} // namespace cli

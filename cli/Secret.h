@@ -1,0 +1,12 @@
+/// Reading secrets; they never come from the command line, which every user of the machine can read.
+#pragma once
+
+#include <string>
+
+namespace cli {
+
+/// The first line of a file ("-": the next line of standard input) or, without a file, what the user
+/// types twice at the terminal for `what`. Throws Failure or UsageError.
+std::string readSecret(const std::string &file, const std::string &what);
+
+} // namespace cli

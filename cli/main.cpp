@@ -1,0 +1,118 @@
+// iscsictl: parse, run, and say what went wrong.
+#include "cli/Commands.h"
+#include "cli/Display.h"
+#include "cli/Request.h"
+#include "iscsiwebapi/ISCSIErrorCode.h"
+
+#include <cstdio>
+
+namespace {
+
+constexpr int EXIT_FAILED = 1;
+constexpr int EXIT_USAGE = 2;
+
+/// The nouns and verbs of the command line, "lun create", as far as they were recognised.
+std::string commandName(const CLI::App &app)
+{
+    const auto chosen = app.get_subcommands();
+    if (chosen.empty())
+        return "";
+    const std::string rest = commandName(*chosen.front());
+    return chosen.front()->get_name() + (rest.empty() ? "" : " " + rest);
+}
+
+void complain(const std::string &command, const std::string &text)
+{
+    fprintf(stderr, "iscsictl: %s%s%s\n", command.c_str(), command.empty() ? "" : ": ", cli::shown(text).c_str());
+}
+
+int usageError(const std::string &command, const std::string &text)
+{
+    complain(command, text);
+    fprintf(stderr, "Try 'iscsictl %s%s--help'.\n", command.c_str(), command.empty() ? "" : " ");
+    return EXIT_USAGE;
+}
+
+/// What to do about a failure, where that can be said; else null.
+const char *hint(int code)
+{
+    switch (code) {
+    case ISCSI::ERR_BAD_LUN_UUID:
+    case ISCSI::ERR_NO_SUCH_LUN:
+        return "'iscsictl lun list' shows the LUNs";
+    case ISCSI::ERR_BAD_TARGET_ID:
+    case ISCSI::ERR_NO_SUCH_TARGET:
+    case ISCSI::ERR_FAILED_TO_LOAD_TARGET:
+        return "'iscsictl target list' shows the targets";
+    case ISCSI::ERR_LUN_IS_MAPPED:
+        return "'iscsictl lun show' tells to which targets, 'iscsictl lun unmap' removes it from them";
+    case ISCSI::ERR_BAD_LUN_LOCATION:
+        return "'iscsi-host volume list' shows the volumes, 'iscsi-host volume add' adds one";
+    case ISCSI::ERR_FAILED_TO_START_SERVICE:
+        return "'iscsi-host boot' starts the iSCSI service";
+    default:
+        return nullptr;
+    }
+}
+
+int failure(const std::string &command, const cli::Failure &failed)
+{
+    std::string text = std::string(ISCSI::ErrorCodeToString(failed.code)) + " (" + std::to_string(failed.code) + ")";
+    if (!failed.reason.empty())
+        text += ": " + failed.reason;
+    complain(command, text);
+    if (const char *advice = hint(failed.code))
+        fprintf(stderr, "iscsictl: hint: %s\n", advice);
+    return EXIT_FAILED;
+}
+
+int runCommandLine(int argc, char **argv)
+{
+    const auto commands = cli::makeCommands();
+    std::string command;
+    try {
+        commands->app.parse(argc, argv);
+        command = commandName(commands->app);
+        commands->run();
+        return 0;
+    } catch (const CLI::Success &asked_for_help) {
+        return commands->app.exit(asked_for_help);
+    } catch (const CLI::ParseError &e) {
+        return usageError(commandName(commands->app), e.what());
+    } catch (const cli::UsageError &e) {
+        return usageError(command, e.reason);
+    } catch (const cli::Failure &e) {
+        return failure(command, e);
+    }
+}
+
+/// Verbs that the shells and the build use; their words are not ours to parse.
+int runHelper(const std::string &verb, const std::vector<std::string> &words)
+{
+    try {
+        if (verb == "__complete")
+            cli::complete(words);
+        else
+            cli::printManual(words.empty() ? "" : words[0]);
+        return 0;
+    } catch (const cli::Failure &) {
+        return EXIT_FAILED;
+    } catch (const cli::UsageError &e) {
+        return usageError(verb, e.reason);
+    }
+}
+
+} // namespace
+
+int main(int argc, char **argv)
+{
+    try {
+        const std::string first = argc > 1 ? argv[1] : "";
+        if (first == "__complete" || first == "__manual")
+            return runHelper(first, std::vector<std::string>(argv + 2, argv + argc));
+        return runCommandLine(argc, argv);
+    } catch (const std::exception &e) {
+        complain("", e.what());
+        return EXIT_FAILED;
+    }
+}

@@ -1,0 +1,18 @@
+/// Where the host platform keeps what it knows and what it runs with.
+#pragma once
+
+#include <string>
+
+namespace norvhost {
+
+/// $ISCSI_HOST_STATE, else /var/lib/iscsi-host: what must survive a restart.
+std::string stateFolder();
+
+/// $ISCSI_HOST_RUN, else /run/iscsi-host: sockets, process IDs and locks.
+std::string runFolder();
+
+/// Makes a folder with mode 0700, its missing parents with 0755. An existing folder is left as it is.
+/// 0, else an error code.
+int makeFolder(const std::string &path);
+
+} // namespace norvhost

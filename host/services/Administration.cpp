@@ -1,0 +1,179 @@
+/// The functions of the public header.
+#include "host/core/LastError.h"
+#include "host/services/Retention.h"
+#include "host/services/Schedules.h"
+#include "host/state/Database.h"
+#include "host/storage/DataFile.h"
+#include "host/storage/LunStore.h"
+#include "host/storage/Sweep.h"
+#include "host/storage/Volumes.h"
+#include "host/target/Service.h"
+#include "iscsihost/host.h"
+#include "platform/error.h"
+
+#include <arpa/inet.h>
+#include <sys/statvfs.h>
+
+using namespace norvhost;
+
+namespace {
+
+constexpr const char *portal_setting = "portal";
+constexpr const char *all_addresses = "all";
+
+int describe(const VolumeRow &row, iscsihost::Volume &volume)
+{
+    volume.path = row.path;
+    volume.image = row.image;
+    if (int err = countLuns(row.path, volume.luns))
+        return err;
+    struct statvfs file_system;
+    volume.mounted = checkMounted(row) == 0 && statvfs(row.path.c_str(), &file_system) == 0;
+    if (volume.mounted) {
+        volume.read_only = file_system.f_flag & ST_RDONLY;
+        volume.size_bytes = file_system.f_blocks * file_system.f_frsize;
+        volume.free_bytes = file_system.f_bavail * file_system.f_frsize;
+    }
+    return 0;
+}
+
+int countTargets(int &count)
+{
+    Query query("SELECT count(*) FROM targets");
+    if (!query.next())
+        return query.error();
+    count = query.integer(0);
+    return 0;
+}
+
+/// Notes a step's failure and lets the others go on: as much as can be of a machine comes up.
+void note(int err, int &first, std::vector<std::string> &failed)
+{
+    if (!err)
+        return;
+    failed.push_back(lastError());
+    if (!first)
+        first = err;
+}
+
+} // namespace
+
+namespace iscsihost {
+
+int addVolume(const std::string &folder)
+{
+    return norvhost::addVolume(folder);
+}
+
+int createVolume(const std::string &folder, uint64_t size, const std::string &image)
+{
+    return norvhost::createVolume(folder, size, image);
+}
+
+int removeVolume(const std::string &folder, std::string &kept_image)
+{
+    return norvhost::removeVolume(folder, kept_image);
+}
+
+int listVolumes(std::vector<Volume> &volumes)
+{
+    std::vector<VolumeRow> rows;
+    if (int err = loadVolumes(rows))
+        return err;
+    std::vector<Volume> described(rows.size());
+    for (size_t i = 0; i < rows.size(); ++i)
+        if (int err = describe(rows[i], described[i]))
+            return err;
+    volumes = std::move(described);
+    return 0;
+}
+
+int sweep(SweepReport &report)
+{
+    SweepResult result;
+    if (int err = sweepVolumes(result))
+        return err;
+    report = {result.removed, result.mended, result.foreign, result.failed};
+    return 0;
+}
+
+int boot(SweepReport &report)
+{
+    std::vector<VolumeRow> rows;
+    if (int err = loadVolumes(rows))
+        return err;
+    int first = 0;
+    std::vector<std::string> failed;
+    for (const VolumeRow &row : rows)
+        note(mountVolume(row), first, failed);
+
+    SweepReport swept;
+    note(sweep(swept), first, failed);
+    // The daemons take what is there: a LUN whose volume is missing must not keep the others from being served.
+    const int started = startService();
+    note(started, first, failed);
+    if (!started)
+        note(reconcileAll(), first, failed);
+
+    swept.failed.insert(swept.failed.begin(), failed.begin(), failed.end());
+    report = std::move(swept);
+    return first;
+}
+
+int supervise()
+{
+    return superviseService();
+}
+
+int stop()
+{
+    return stopService();
+}
+
+int setPortal(const std::string &address)
+{
+    in6_addr parsed;
+    if (address != all_addresses && inet_pton(AF_INET, address.c_str(), &parsed) != 1 &&
+        inet_pton(AF_INET6, address.c_str(), &parsed) != 1)
+        return fail(NORV_ERR_BAD_PARAMETER, "'%s' is no IPv4 or IPv6 address, nor '%s'", address.c_str(),
+                    all_addresses);
+    return setSetting(portal_setting, address);
+}
+
+int getPortal(std::string &address)
+{
+    return getSetting(portal_setting, all_addresses, address);
+}
+
+int status(Status &status)
+{
+    Status now;
+    if (int err = getPortal(now.portal))
+        return err;
+    if (int err = listVolumes(now.volumes))
+        return err;
+    if (int err = countTargets(now.targets))
+        return err;
+    const auto look_at = [&](const LunRow &row) {
+        ++now.luns;
+        if (checkData(row.record) != 0)
+            now.unhealthy.push_back({row.record.lid, row.record.name, lastError()});
+    };
+    if (int err = forEachLun(look_at))
+        return err;
+    now.service_alive = iscsiServiceAlive();
+    status = std::move(now);
+    return 0;
+}
+
+int addSchedule(const std::string &kind, int lid, const std::string &rule, int64_t &id)
+{
+    return norvhost::addSchedule(kind, lid, rule, id);
+}
+
+int setRetentionPolicy(const std::string &kind, const std::string &key, const std::string &policy)
+{
+    return norvhost::setRetentionPolicy(kind, key, policy);
+}
+
+} // namespace iscsihost

@@ -1,0 +1,160 @@
+#include "host/state/Schema.h"
+
+#include "host/core/LastError.h"
+#include "host/state/StoreError.h"
+#include "platform/error.h"
+
+#include <iterator>
+#include <sqlite3.h>
+#include <string>
+
+namespace norvhost {
+namespace {
+
+/// The n-th entry leads from version n to n + 1. A released entry never changes; append.
+const char *const steps[] = {
+    R"sql(
+CREATE TABLE settings (
+    key TEXT PRIMARY KEY,
+    value TEXT NOT NULL
+) STRICT, WITHOUT ROWID;
+-- The store's identity: it marks the data files that belong to this store's rows.
+INSERT INTO settings VALUES ('store', lower(hex(randomblob(16))));
+
+-- The image is the file that we loop-mount at the path; empty where somebody else mounts it.
+CREATE TABLE volumes (
+    path TEXT PRIMARY KEY,
+    mount_point TEXT NOT NULL,
+    image TEXT NOT NULL DEFAULT ''
+) STRICT, WITHOUT ROWID;
+
+CREATE TABLE luns (
+    lid INTEGER PRIMARY KEY CHECK (lid BETWEEN 1 AND 1024),
+    uuid TEXT NOT NULL UNIQUE,
+    name TEXT NOT NULL UNIQUE,
+    type INTEGER NOT NULL,
+    location TEXT NOT NULL,
+    size INTEGER NOT NULL CHECK (size > 0),
+    extent_size INTEGER NOT NULL DEFAULT 0,
+    restored_time INTEGER NOT NULL DEFAULT 0,
+    options INTEGER NOT NULL DEFAULT 0,
+    loaded INTEGER NOT NULL DEFAULT 1 CHECK (loaded IN (0, 1))
+) STRICT;
+
+CREATE TABLE targets (
+    tid INTEGER PRIMARY KEY CHECK (tid BETWEEN 1 AND 256),
+    name TEXT NOT NULL UNIQUE,
+    iqn TEXT NOT NULL UNIQUE,
+    enabled INTEGER NOT NULL CHECK (enabled IN (0, 1)),
+    header_digest INTEGER NOT NULL DEFAULT 0,
+    data_digest INTEGER NOT NULL DEFAULT 0,
+    max_recv_seg_bytes INTEGER NOT NULL,
+    max_send_seg_bytes INTEGER NOT NULL,
+    max_sessions INTEGER NOT NULL,
+    auth_type INTEGER NOT NULL,
+    user TEXT NOT NULL DEFAULT '',
+    password TEXT NOT NULL DEFAULT '',
+    mutual_user TEXT NOT NULL DEFAULT '',
+    mutual_password TEXT NOT NULL DEFAULT ''
+) STRICT;
+
+CREATE TABLE mappings (
+    tid INTEGER NOT NULL REFERENCES targets ON DELETE CASCADE,
+    lid INTEGER NOT NULL REFERENCES luns ON DELETE RESTRICT,
+    mapping_index INTEGER NOT NULL,
+    PRIMARY KEY (tid, lid),
+    UNIQUE (tid, mapping_index)
+) STRICT, WITHOUT ROWID;
+CREATE INDEX mappings_of_lun ON mappings (lid);
+
+CREATE TABLE maskings (
+    tid INTEGER NOT NULL REFERENCES targets ON DELETE CASCADE,
+    iqn TEXT NOT NULL,
+    permission INTEGER NOT NULL,
+    PRIMARY KEY (tid, iqn)
+) STRICT, WITHOUT ROWID;
+
+-- AUTOINCREMENT: the ID of a removed job never comes back as another one's.
+CREATE TABLE schedules (
+    id INTEGER PRIMARY KEY AUTOINCREMENT,
+    kind TEXT NOT NULL CHECK (kind IN ('backup', 'snapshot')),
+    lid INTEGER NOT NULL REFERENCES luns ON DELETE CASCADE,
+    rule TEXT NOT NULL,
+    UNIQUE (lid, kind)
+) STRICT;
+
+CREATE TABLE retention_policies (
+    kind TEXT NOT NULL,
+    key TEXT NOT NULL,
+    policy TEXT NOT NULL,
+    PRIMARY KEY (kind, key)
+) STRICT, WITHOUT ROWID;
+)sql",
+};
+
+constexpr int latest = static_cast<int>(std::size(steps));
+
+int execute(sqlite3 *connection, const char *sql, const char *step)
+{
+    const int result = sqlite3_exec(connection, sql, nullptr, nullptr, nullptr);
+    return result == SQLITE_OK ? 0 : storeError(connection, result, step);
+}
+
+int readVersion(sqlite3 *connection, int &version)
+{
+    sqlite3_stmt *statement = nullptr;
+    int result = sqlite3_prepare_v2(connection, "PRAGMA user_version", -1, &statement, nullptr);
+    if (result == SQLITE_OK)
+        result = sqlite3_step(statement);
+    if (result == SQLITE_ROW)
+        version = sqlite3_column_int(statement, 0);
+    sqlite3_finalize(statement);
+    return result == SQLITE_ROW ? 0 : storeError(connection, result, "cannot read the state's version");
+}
+
+/// One step, inside a transaction.
+int takeStep(sqlite3 *connection)
+{
+    int version;
+    if (int err = readVersion(connection, version))
+        return err;
+    if (version >= latest)
+        return 0; // another process took it while we waited
+    if (int err = execute(connection, steps[version], "cannot upgrade the state"))
+        return err;
+    const std::string set_version = "PRAGMA user_version = " + std::to_string(version + 1);
+    return execute(connection, set_version.c_str(), "cannot set the state's version");
+}
+
+} // namespace
+
+int schemaVersion()
+{
+    return latest;
+}
+
+int upgradeSchema(sqlite3 *connection)
+{
+    for (;;) {
+        int version;
+        if (int err = readVersion(connection, version))
+            return err;
+        if (version > latest)
+            return fail(NORV_ERR_GET_CONFIG, "the state was written by a newer version (its format is %d, we know %d)",
+                        version, latest);
+        if (version == latest)
+            return 0;
+
+        if (int err = execute(connection, "BEGIN IMMEDIATE", "cannot begin to upgrade the state"))
+            return err;
+        int err = takeStep(connection);
+        if (!err)
+            err = execute(connection, "COMMIT", "cannot upgrade the state");
+        if (err) {
+            sqlite3_exec(connection, "ROLLBACK", nullptr, nullptr, nullptr);
+            return err;
+        }
+    }
+}
+
+} // namespace norvhost

@@ -1,0 +1,119 @@
+/// The platform's questions about LUNs.
+#include "host/core/LastError.h"
+#include "host/core/Lock.h"
+#include "host/storage/DataFile.h"
+#include "host/storage/LunStore.h"
+#include "platform/error.h"
+#include "platform/iscsi_lun.h"
+
+#include <cstdio>
+#include <cstdlib>
+#include <memory>
+
+using namespace norvhost;
+
+namespace {
+
+int missingArgument(const char *function)
+{
+    return fail(NORV_ERR_NULL_POINTER, "%s: an argument is missing", function);
+}
+
+} // namespace
+
+int NORViSCSILunConfigGetByUUID(const char *uuid, _tag_iscsi_lun_ *lun, int)
+{
+    if (!uuid || !lun)
+        return missingArgument(__func__);
+    LunRow row;
+    if (int err = loadLunByUuid(uuid, row))
+        return err;
+    *lun = row.record;
+    return 0;
+}
+
+int NORViSCSILunConfigGetAll(_tag_iscsi_lun_ **luns, size_t *count)
+{
+    if (!luns || !count)
+        return missingArgument(__func__);
+    // Room for all there can be; what is not written costs nothing.
+    std::unique_ptr<_tag_iscsi_lun_, decltype(&free)> all(
+        static_cast<_tag_iscsi_lun_ *>(malloc(NORV_LUN_ID_MAX * sizeof(_tag_iscsi_lun_))), free);
+    if (!all)
+        return fail(NORV_ERR_OUT_OF_MEMORY, "no memory for the LUN records");
+    size_t found = 0;
+    if (int err = forEachLun([&](const LunRow &row) { all.get()[found++] = row.record; }))
+        return err;
+    *luns = found ? all.release() : nullptr;
+    *count = found;
+    return 0;
+}
+
+int NORViSCSILunGetByLunId(int lid, _tag_iscsi_lun_ *lun)
+{
+    if (!lun)
+        return missingArgument(__func__);
+    LunRow row;
+    if (int err = loadLunByLid(lid, row))
+        return err;
+    *lun = row.record;
+    return 0;
+}
+
+int NORViSCSILunGetByLunName(const char *name, _tag_iscsi_lun_ *lun)
+{
+    if (!name || !lun)
+        return missingArgument(__func__);
+    LunRow row;
+    if (int err = loadLunByName(name, row))
+        return err;
+    *lun = row.record;
+    return 0;
+}
+
+int NORViSCSILunIsNameExist(const char *name, bool *exists)
+{
+    if (!name || !exists)
+        return missingArgument(__func__);
+    LunRow row;
+    const int err = loadLunByName(name, row);
+    if (err && err != NORV_ERR_NO_SUCH_LUN)
+        return err;
+    *exists = !err;
+    return 0;
+}
+
+int NORViSCSILunIsLocked(const _tag_iscsi_lun_ *lun, bool *locked)
+{
+    if (!lun || !locked)
+        return missingArgument(__func__);
+    return lunLockHeld(lun->lid, *locked);
+}
+
+int NORViSCSILunProgressGet(const _tag_iscsi_lun_ *lun, _tag_iscsi_lun_progress_ *progress)
+{
+    if (!lun || !progress)
+        return missingArgument(__func__);
+    LunAction action;
+    if (int err = lunLockAction(lun->lid, action))
+        return err;
+    progress->st = action.state;
+    progress->percent = action.percent;
+    return 0;
+}
+
+int NORViSCSIFamilyConfGetByLID(int lid, _tag_iscsi_family_ *family)
+{
+    if (!family)
+        return missingArgument(__func__);
+    LunRow row;
+    const int err = loadLunByLid(lid, row);
+    if (err == NORV_ERR_NO_SUCH_LUN)
+        return fail(NORV_ERR_NO_SUCH_FAMILY, "there is no LUN %d", lid);
+    if (err)
+        return err;
+    *family = _tag_iscsi_family_();
+    family->lid = lid;
+    snprintf(family->status, sizeof family->status, "%s", checkData(row.record) == 0 ? "Healthy" : "Unhealthy");
+    return 0;
+}

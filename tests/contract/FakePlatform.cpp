@@ -1,0 +1,30 @@
+#include "tests/contract/Platform.h"
+#include "tests/fake/Fake.h"
+
+namespace contract {
+
+Platform::Platform() : volume("/volume1")
+{
+    fake::reset();
+}
+
+Platform::~Platform() = default;
+
+void Platform::startService() {}
+
+void Platform::addSnapshotTask(int, const std::string &lun_name)
+{
+    fake::model().jobs[1] = {lun_name, 0};
+}
+
+void Platform::addScheduledSnapshots(int lid)
+{
+    fake::model().jobs[2] = {"", lid};
+}
+
+void Platform::addRetentionPolicy(int lid)
+{
+    fake::model().retention_policies.insert({"Lun#", std::to_string(lid)});
+}
+
+} // namespace contract

@@ -1,0 +1,26 @@
+/// The platform under test: made empty for a test, and cleared away behind it.
+#pragma once
+
+#include <string>
+
+namespace contract {
+
+class Platform {
+public:
+    Platform();
+    ~Platform();
+    Platform(const Platform &) = delete;
+    Platform &operator=(const Platform &) = delete;
+
+    /// Runs the iSCSI service, which targets need.
+    void startService();
+
+    /// Adds what the platform's functions only look up and remove.
+    void addSnapshotTask(int lid, const std::string &lun_name);
+    void addScheduledSnapshots(int lid);
+    void addRetentionPolicy(int lid);
+
+    std::string volume; ///< a location for LUNs, with room for a few small ones
+};
+
+} // namespace contract

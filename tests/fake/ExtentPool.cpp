@@ -1,0 +1,97 @@
+// Map files: found by their path, so that a caller with a wrong path finds none.
+#include "platform/error.h"
+#include "platform/extent_pool.h"
+#include "tests/fake/Script.h"
+
+using namespace fake;
+
+namespace {
+
+MapFile *byPath(const char *path)
+{
+    for (auto &[lid, lun] : model().luns) {
+        if (mapFilePath(lun.record) == path)
+            return &lun.map_file;
+    }
+    return nullptr;
+}
+
+int countOf(const char *name, const char *path, uint64_t MapFile::*count, uint64_t *out)
+{
+    const MapFile *file = byPath(path);
+    if (!file)
+        return NORV_ERR_FILE_NOT_FOUND;
+    *out = static_cast<uint64_t>(answerOf(name, static_cast<long>(file->*count)));
+    return 0;
+}
+
+} // namespace
+
+std::string fake::mapFilePath(const _tag_iscsi_lun_ &lun)
+{
+    const bool is_extent_pool = (lun.type & 15) == 15;
+    const bool has_long_number = (lun.type & 71) == 71;
+    return textOf(lun.location) + (lun.options & 1 ? "/@EP_trash" : "/@iSCSITrg") + "/iSCSI_" +
+           std::to_string(lun.lid) + (is_extent_pool ? "_Extent_" : "_") + textOf(lun.name) +
+           (has_long_number ? "_00000" : "_000");
+}
+
+int NORVExtentPoolMapFileMappedSizeGet(const char *path, const char *location, uint64_t *size)
+{
+    if (auto failure = called(__func__, path, location))
+        return *failure;
+    const MapFile *file = byPath(path);
+    if (!file)
+        return NORV_ERR_FILE_NOT_FOUND;
+    *size = file->mapped_size;
+    return 0;
+}
+
+int NORVExtentPoolMapFileBaseVersionGet(const char *path, char *version)
+{
+    if (auto failure = called(__func__, path))
+        return *failure;
+    const MapFile *file = byPath(path);
+    if (!file)
+        return NORV_ERR_FILE_NOT_FOUND;
+    snprintf(version, 37, "%s", file->base_version.c_str());
+    return 0;
+}
+
+int NORVExtentPoolMapFileVersionInfoGet(const char *path, _tag_map_file_version_ *info)
+{
+    if (auto failure = called(__func__, path))
+        return *failure;
+    const MapFile *file = byPath(path);
+    if (!file)
+        return NORV_ERR_FILE_NOT_FOUND;
+    put(info->base_version, file->base_version);
+    put(info->current_version, file->current_version);
+    return 0;
+}
+
+int NORVExtentPoolMapFileTotalCountGet(const char *path, uint64_t *count)
+{
+    if (auto failure = called(__func__, path))
+        return *failure;
+    return countOf(__func__, path, &MapFile::total_count, count);
+}
+
+int NORVExtentPoolMapFileSyncedCountGet(const char *path, uint64_t *count)
+{
+    if (auto failure = called(__func__, path))
+        return *failure;
+    return countOf(__func__, path, &MapFile::synced_count, count);
+}
+
+int NORViSCSIChildLunSyncProgressGet(const char *path, uint64_t *done, uint64_t *total)
+{
+    if (auto failure = called(__func__, path))
+        return *failure;
+    const MapFile *file = byPath(path);
+    if (!file)
+        return NORV_ERR_FILE_NOT_FOUND;
+    *done = file->copied;
+    *total = file->to_copy;
+    return 0;
+}

@@ -1,0 +1,315 @@
+// LUNs and their mappings on the fake's model.
+#include "platform/error.h"
+#include "tests/fake/Script.h"
+
+#include <algorithm>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+
+using namespace fake;
+
+namespace {
+
+template <class Test>
+LUN *findLUN(Test test)
+{
+    for (auto &[lid, lun] : model().luns) {
+        if (test(lun.record))
+            return &lun;
+    }
+    return nullptr;
+}
+
+LUN *byUUID(const char *uuid)
+{
+    return findLUN([&](const auto &record) { return strcmp(record.uuid, uuid) == 0; });
+}
+
+LUN *byName(const char *name)
+{
+    return findLUN([&](const auto &record) { return strcmp(record.name, name) == 0; });
+}
+
+LUN *byID(int lid)
+{
+    const auto found = model().luns.find(lid);
+    return found == model().luns.end() ? nullptr : &found->second;
+}
+
+int copyOut(const LUN *lun, _tag_iscsi_lun_ *out)
+{
+    if (!lun)
+        return NORV_ERR_NO_SUCH_LUN;
+    *out = lun->record;
+    return 0;
+}
+
+bool isMapped(int lid)
+{
+    const auto &mappings = model().mappings;
+    return std::any_of(mappings.begin(), mappings.end(), [&](const auto &mapping) { return mapping.lid == lid; });
+}
+
+bool isType(int type)
+{
+    switch (type) {
+    case NORV_LUN_TYPE_BLOCK:
+    case NORV_LUN_TYPE_FILE:
+    case NORV_LUN_TYPE_THIN:
+    case NORV_LUN_TYPE_ADV:
+    case NORV_LUN_TYPE_SINK:
+    case NORV_LUN_TYPE_47:
+    case NORV_LUN_TYPE_71:
+    case NORV_LUN_TYPE_79:
+        return true;
+    default:
+        return false;
+    }
+}
+
+bool isSize(uint64_t size)
+{
+    return size != 0 && size % 512 == 0 && size <= INT64_MAX;
+}
+
+int judge(const _tag_iscsi_lun_ &lun)
+{
+    if (!isType(lun.type))
+        return NORV_ERR_LUN_TYPE;
+    if (!isName(lun.name, sizeof(lun.name) - 1))
+        return NORV_ERR_LUN_NAME;
+    if (lun.type != NORV_LUN_TYPE_BLOCK && model().volumes.count(lun.location) == 0)
+        return NORV_ERR_LUN_LOCATION;
+    if (!isSize(lun.size))
+        return NORV_ERR_LUN_SIZE;
+    return byName(lun.name) ? NORV_ERR_LUN_NAME_EXISTS : 0;
+}
+
+int freeID()
+{
+    int lid = 1;
+    while (byID(lid))
+        ++lid;
+    return lid;
+}
+
+/// The LUN number that a new mapping of the target gets; 0 is the target's own.
+int freeIndex(int tid)
+{
+    const auto &mappings = model().mappings;
+    int index = 1;
+    while (std::any_of(mappings.begin(), mappings.end(),
+                       [&](const auto &mapping) { return mapping.tid == tid && mapping.mapping_index == index; }))
+        ++index;
+    return index;
+}
+
+auto findMapping(int tid, int lid)
+{
+    auto &mappings = model().mappings;
+    return std::find_if(mappings.begin(), mappings.end(),
+                        [&](const auto &mapping) { return mapping.tid == tid && mapping.lid == lid; });
+}
+
+std::string idList(const int ids[], int count)
+{
+    std::string text;
+    for (int i = 0; i < count; ++i)
+        text += (i ? " " : "") + std::to_string(ids[i]);
+    return text;
+}
+
+/// Loads or unloads; with the trash option the LUN also leaves or enters the trash.
+int setLoaded(const _tag_iscsi_lun_ *record, bool is_loaded)
+{
+    LUN *lun = byUUID(record->uuid);
+    if (!lun)
+        return NORV_ERR_NO_SUCH_LUN;
+    if (record->options & NORV_LUN_OPTION_TRASH) {
+        if (is_loaded)
+            lun->record.options &= ~static_cast<uint32_t>(NORV_LUN_OPTION_TRASH);
+        else
+            lun->record.options |= NORV_LUN_OPTION_TRASH;
+    }
+    lun->is_loaded = is_loaded;
+    return 0;
+}
+
+} // namespace
+
+int NORViSCSILunConfigGetByUUID(const char *uuid, _tag_iscsi_lun_ *lun, int flags)
+{
+    if (auto failure = called(__func__, uuid, flags))
+        return *failure;
+    return copyOut(byUUID(uuid), lun);
+}
+
+int NORViSCSILunConfigGetAll(_tag_iscsi_lun_ **luns, size_t *count)
+{
+    if (auto failure = called(__func__))
+        return *failure;
+    const auto &known = model().luns;
+    auto *records =
+        known.empty() ? nullptr : static_cast<_tag_iscsi_lun_ *>(malloc(known.size() * sizeof(_tag_iscsi_lun_)));
+    if (!known.empty() && !records)
+        return NORV_ERR_OUT_OF_MEMORY;
+    *luns = records;
+    *count = known.size();
+    for (const auto &[lid, lun] : known)
+        *records++ = lun.record;
+    return 0;
+}
+
+int NORViSCSILunGetByLunId(int lid, _tag_iscsi_lun_ *lun)
+{
+    if (auto failure = called(__func__, lid))
+        return *failure;
+    return copyOut(byID(lid), lun);
+}
+
+int NORViSCSILunGetByLunName(const char *name, _tag_iscsi_lun_ *lun)
+{
+    if (auto failure = called(__func__, name))
+        return *failure;
+    return copyOut(byName(name), lun);
+}
+
+int NORViSCSILunIsNameExist(const char *name, bool *exists)
+{
+    if (auto failure = called(__func__, name))
+        return *failure;
+    *exists = byName(name) != nullptr;
+    return 0;
+}
+
+int NORViSCSILunCreate(_tag_iscsi_lun_ *lun)
+{
+    if (auto failure = called(__func__, lun->name, lun->type, lun->location, lun->size, lun->extent_size))
+        return *failure;
+    if (int err = judge(*lun))
+        return err;
+    const int lid = freeID();
+    if (lid > NORV_LUN_ID_MAX)
+        return NORV_ERR_MAX_LUNS;
+    lun->lid = lid;
+    lun->options = 0;
+    lun->restored_time = 0;
+    snprintf(lun->uuid, sizeof(lun->uuid), "00000000-0000-4000-8000-%012x", ++model().uuids_made);
+    model().luns[lid].record = *lun;
+    return 0;
+}
+
+int NORViSCSILunDelete(_tag_iscsi_lun_ *lun)
+{
+    if (auto failure = called(__func__, lun->uuid))
+        return *failure;
+    const LUN *known = byUUID(lun->uuid);
+    if (!known)
+        return NORV_ERR_NO_SUCH_LUN;
+    if (isMapped(known->record.lid))
+        return NORV_ERR_LUN_MAPPED;
+    if (known->is_locked)
+        return NORV_ERR_LUN_LOCKED;
+    model().luns.erase(known->record.lid);
+    return 0;
+}
+
+int NORViSCSILunUpdate(_tag_iscsi_lun_ *lun)
+{
+    if (auto failure = called(__func__, lun->uuid, lun->name, lun->size))
+        return *failure;
+    LUN *known = byUUID(lun->uuid);
+    if (!known)
+        return NORV_ERR_NO_SUCH_LUN;
+    if (!isName(lun->name, sizeof(lun->name) - 1))
+        return NORV_ERR_LUN_NAME;
+    if (const LUN *other = byName(lun->name); other && other != known)
+        return NORV_ERR_LUN_NAME_EXISTS;
+    if (!isSize(lun->size) || lun->size < known->record.size)
+        return NORV_ERR_LUN_SIZE;
+    if (known->is_locked)
+        return NORV_ERR_LUN_LOCKED;
+    put(known->record.name, lun->name);
+    known->record.size = lun->size;
+    return 0;
+}
+
+int NORViSCSILunLoad(_tag_iscsi_lun_ *lun)
+{
+    if (auto failure = called(__func__, lun->uuid, lun->options))
+        return *failure;
+    return setLoaded(lun, true);
+}
+
+int NORViSCSILunUnload(_tag_iscsi_lun_ *lun)
+{
+    if (auto failure = called(__func__, lun->uuid, lun->options))
+        return *failure;
+    return setLoaded(lun, false);
+}
+
+int NORViSCSILunIsLocked(const _tag_iscsi_lun_ *lun, bool *locked)
+{
+    if (auto failure = called(__func__, lun->lid))
+        return *failure;
+    const LUN *known = byID(lun->lid);
+    if (!known)
+        return NORV_ERR_NO_SUCH_LUN;
+    *locked = answerOf(__func__, known->is_locked) != 0;
+    return 0;
+}
+
+int NORViSCSILunProgressGet(const _tag_iscsi_lun_ *lun, _tag_iscsi_lun_progress_ *progress)
+{
+    if (auto failure = called(__func__, lun->lid))
+        return *failure;
+    const LUN *known = byID(lun->lid);
+    if (!known)
+        return NORV_ERR_NO_SUCH_LUN;
+    progress->st = static_cast<int32_t>(answerOf(__func__, known->progress));
+    progress->percent = -1;
+    return 0;
+}
+
+int NORViSCSIFamilyConfGetByLID(int lid, _tag_iscsi_family_ *family)
+{
+    if (auto failure = called(__func__, lid))
+        return *failure;
+    const LUN *known = byID(lid);
+    if (!known)
+        return NORV_ERR_NO_SUCH_FAMILY;
+    family->lid = lid;
+    put(family->status, known->health);
+    return 0;
+}
+
+int NORViSCSILunMappingsAdd(const int target_ids[], int lid, int count)
+{
+    if (auto failure = called(__func__, idList(target_ids, count), lid, count))
+        return *failure;
+    if (!byID(lid))
+        return NORV_ERR_NO_SUCH_LUN;
+    for (int i = 0; i < count; ++i) {
+        if (model().targets.count(target_ids[i]) == 0)
+            return NORV_ERR_NO_SUCH_TARGET;
+    }
+    for (int i = 0; i < count; ++i) {
+        if (findMapping(target_ids[i], lid) == model().mappings.end())
+            model().mappings.push_back({target_ids[i], lid, freeIndex(target_ids[i]), nullptr});
+    }
+    return 0;
+}
+
+int NORViSCSILunMappingsRemove(const int target_ids[], int lid, int count)
+{
+    if (auto failure = called(__func__, idList(target_ids, count), lid, count))
+        return *failure;
+    for (int i = 0; i < count; ++i) {
+        if (findMapping(target_ids[i], lid) == model().mappings.end())
+            return NORV_ERR_NO_SUCH_MAPPING;
+    }
+    for (int i = 0; i < count; ++i)
+        model().mappings.erase(findMapping(target_ids[i], lid));
+    return 0;
+}

@@ -1,0 +1,63 @@
+/// How the fake's functions take part in the journal and the script.
+#pragma once
+
+#include "tests/fake/Fake.h"
+
+#include <algorithm>
+#include <cstring>
+#include <optional>
+#include <sstream>
+#include <string>
+
+namespace fake {
+
+/// Notes a call; the value that the script wants it to fail with, if any.
+std::optional<long> noteCall(const char *name, const std::string &arguments);
+
+/// What the call just noted answers: the script's value for it, else `otherwise`.
+long answerOf(const char *name, long otherwise);
+
+inline std::string joined()
+{
+    return {};
+}
+
+template <class First, class... Rest>
+std::string joined(const First &first, const Rest &...rest)
+{
+    std::ostringstream text;
+    text << first;
+    ((text << ", " << rest), ...);
+    return text.str();
+}
+
+/// The first thing that every function of the platform does:
+///
+///     if (auto failure = called(__func__, uuid))
+///         return *failure;
+template <class... Arguments>
+std::optional<int> called(const char *name, const Arguments &...arguments)
+{
+    if (auto failure = noteCall(name, joined(arguments...)))
+        return static_cast<int>(*failure);
+    return std::nullopt;
+}
+
+/// Copies a text into a character field that is known to hold it.
+template <size_t size>
+void put(char (&field)[size], const std::string &text)
+{
+    text.copy(field, size - 1);
+    field[std::min(size - 1, text.size())] = '\0';
+}
+
+template <size_t size>
+std::string textOf(const char (&field)[size])
+{
+    return std::string(field, strnlen(field, size));
+}
+
+/// Whether a text can name an object: 1 to `longest` bytes, none of them a control character or "/".
+bool isName(const std::string &text, size_t longest);
+
+} // namespace fake

@@ -1,0 +1,141 @@
+#include "tests/unit/Library.h"
+
+#include <json/reader.h>
+
+#include <cstdio>
+#include <cstdlib>
+#include <ctime>
+#include <filesystem>
+#include <memory>
+#include <stdexcept>
+
+namespace unit {
+namespace {
+
+/// Takes what stands before `delimiter` off the front of the text.
+std::string takeUntil(std::string &text, char delimiter)
+{
+    const size_t end = text.find(delimiter);
+    const std::string taken = text.substr(0, end);
+    text.erase(0, end == std::string::npos ? end : end + 1);
+    return taken;
+}
+
+std::string withoutPlace(const fake::LogLine &line)
+{
+    const std::string tag = "[E] iSCSIWebAPI:";
+    EXPECT_EQ(line.priority, 3);
+    EXPECT_EQ(line.text.find(SECRET), std::string::npos) << line.text;
+    EXPECT_EQ(line.text.find(MUTUAL_SECRET), std::string::npos) << line.text;
+
+    std::string text = line.text;
+    const bool is_tagged = text.compare(0, tag.size(), tag) == 0;
+    if (is_tagged)
+        text.erase(0, tag.size());
+    const std::string file = takeUntil(text, ':');
+    EXPECT_TRUE(std::filesystem::path(file).is_relative() && std::filesystem::exists(ISCSIWEBAPI_SOURCE_DIR "/" + file))
+        << line.text;
+    const size_t digits = text.find_first_not_of("0123456789");
+    EXPECT_TRUE(digits != 0 && digits != std::string::npos) << line.text;
+    const char behind_number = text[digits];
+    text.erase(0, digits + 1);
+    const std::string method = behind_number == ':' ? takeUntil(text, ' ') : "";
+    return (is_tagged ? "[E] " : "") + method + ": " + text;
+}
+
+} // namespace
+
+LibraryTest::LibraryTest()
+{
+    setenv("TZ", "UTC0", 1);
+    tzset();
+    fake::reset();
+    fake::forgetLogLines();
+    fake::forgetSleep();
+}
+
+LibraryTest::~LibraryTest()
+{
+    logged(); // for its checks, on what the test did not look at
+    EXPECT_EQ(fake::unfreedAnswers(), 0);
+}
+
+Lines logged()
+{
+    Lines lines;
+    for (const auto &line : fake::logLines())
+        lines.push_back(withoutPlace(line));
+    fake::forgetLogLines();
+    return lines;
+}
+
+Lines called()
+{
+    Lines lines;
+    for (const auto &call : fake::calls())
+        lines.push_back(call.name + "(" + call.arguments + ")");
+    fake::forgetCalls();
+    return lines;
+}
+
+std::string uuidOf(int lid)
+{
+    char uuid[37];
+    snprintf(uuid, sizeof(uuid), "1a2b3c4d-0000-4000-8000-%012d", lid);
+    return uuid;
+}
+
+fake::LUN &addLUN(int lid, const std::string &name, int type)
+{
+    fake::LUN lun;
+    lun.record.lid = lid;
+    lun.record.type = type;
+    lun.record.size = GIB;
+    lun.record.extent_size = 65536;
+    uuidOf(lid).copy(lun.record.uuid, sizeof(lun.record.uuid) - 1);
+    name.copy(lun.record.name, sizeof(lun.record.name) - 1);
+    std::string("/volume1").copy(lun.record.location, sizeof(lun.record.location) - 1);
+    return fake::model().luns[lid] = lun;
+}
+
+_tag_iscsi_lun_ recordOf(int lid)
+{
+    return fake::model().luns.at(lid).record;
+}
+
+fake::Target &addTarget(int tid, const std::string &name)
+{
+    fake::Target target;
+    auto &record = target.record;
+    record.tid = tid;
+    record.enabled = 1;
+    record.header_digest = 1;
+    record.max_recv_seg_bytes = 262144;
+    record.max_send_seg_bytes = 4096;
+    record.max_sessions = 2;
+    record.auth_type = NORV_TARGET_AUTH_MUTUAL_CHAP;
+    name.copy(record.name, sizeof(record.name) - 1);
+    ("iqn.2000-01.example:" + name).copy(record.iqn, sizeof(record.iqn) - 1);
+    std::string("alice").copy(record.user, sizeof(record.user) - 1);
+    std::string(SECRET).copy(record.password, sizeof(record.password) - 1);
+    std::string("bob").copy(record.mutual_user, sizeof(record.mutual_user) - 1);
+    std::string(MUTUAL_SECRET).copy(record.mutual_password, sizeof(record.mutual_password) - 1);
+    return fake::model().targets[tid] = target;
+}
+
+void addMapping(int tid, int lid, int mapping_index)
+{
+    fake::model().mappings.push_back({tid, lid, mapping_index, nullptr});
+}
+
+Json::Value parsed(const std::string &json)
+{
+    const std::unique_ptr<Json::CharReader> reader(Json::CharReaderBuilder().newCharReader());
+    Json::Value value;
+    std::string errors;
+    if (!reader->parse(json.data(), json.data() + json.size(), &value, &errors))
+        throw std::invalid_argument(json + ": " + errors);
+    return value;
+}
+
+} // namespace unit

@@ -1,0 +1,53 @@
+/// The fixture of the library's tests, and the words that they are written in.
+#pragma once
+
+#include "tests/fake/Fake.h"
+#include "tests/fake/Process.h"
+
+#include <gtest/gtest.h>
+#include <json/value.h>
+
+#include <string>
+#include <vector>
+
+namespace unit {
+
+using Lines = std::vector<std::string>;
+
+/// What a failing platform call returns, and how it stands in a log line.
+constexpr int INJECTED = 18990999;
+const char *const INJECTED_TEXT = "Unknown error 18990999";
+const char *const INJECTED_ERROR = "18990999 (Unknown error 18990999)";
+
+/// Secrets of the targets that addTarget makes. No log line of any test may hold one.
+const char *const SECRET = "opensesame-in";
+const char *const MUTUAL_SECRET = "opensesame-out";
+
+constexpr unsigned long long GIB = 1ULL << 30;
+
+class LibraryTest : public testing::Test {
+protected:
+    LibraryTest();
+    ~LibraryTest() override;
+};
+
+/// Log lines since the last call: "method: text" for "file:line:method text", ": text" for a head
+/// without method, "[E] method: text" for the tagged form.
+Lines logged();
+
+/// Platform calls since the last call, as "Name(arguments)".
+Lines called();
+
+std::string uuidOf(int lid);
+
+/// A LUN in the fake's model: 1 GiB in /volume1, with extents of 64 KiB.
+fake::LUN &addLUN(int lid, const std::string &name, int type = NORV_LUN_TYPE_ADV);
+_tag_iscsi_lun_ recordOf(int lid);
+
+/// An enabled target in the fake's model, with CHAP in both directions.
+fake::Target &addTarget(int tid, const std::string &name);
+void addMapping(int tid, int lid, int mapping_index = 1);
+
+Json::Value parsed(const std::string &json);
+
+} // namespace unit

@@ -1,0 +1,135 @@
+#include "tests/unit/Sweep.h"
+
+#include <algorithm>
+#include <filesystem>
+#include <set>
+
+#ifdef __SANITIZE_ADDRESS__
+#include <sanitizer/lsan_interface.h>
+#endif
+
+namespace unit {
+namespace {
+
+/// Functions do not share one way to fail.
+long failureOf(const std::string &call)
+{
+    static const std::map<std::string, long> others = {
+        {"NORViSCSILunTaskGetSchIDByName", -1},
+        {"ScheduleSnapshotTaskGetIDByLid", -1},
+        {"NORVSchedTaskRemove", -77},
+        {"NORVRETENTIONRemovePolicy", -77},
+        {"NLIBCExec", 1},
+    };
+    const auto found = others.find(call);
+    return found == others.end() ? INJECTED : found->second;
+}
+
+std::vector<std::string> callNames()
+{
+    std::vector<std::string> names;
+    for (const auto &call : fake::calls())
+        names.push_back(call.name);
+    return names;
+}
+
+void start(const Operation &operation)
+{
+    fake::reset();
+    operation.set_up();
+    fake::forgetLogLines();
+}
+
+/// The line of the table for the n-th call, which is the `occurrence`-th of its name.
+const Failure *find(const Operation &operation, const std::string &call, long occurrence)
+{
+    const std::string numbered = call + "#" + std::to_string(occurrence);
+    const Failure *result = nullptr;
+    for (const auto &failure : operation.failures) {
+        if (failure.call == numbered)
+            return &failure;
+        if (failure.call == call)
+            result = &failure;
+    }
+    return result;
+}
+
+void replace(std::string &text, const std::string &what, const std::string &with)
+{
+    for (size_t at = text.find(what); at != std::string::npos; at = text.find(what, at + with.size()))
+        text.replace(at, what.size(), with);
+}
+
+Lines filledIn(Lines lines, const std::string &info)
+{
+    for (auto &line : lines) {
+        replace(line, "{err}", INJECTED_ERROR);
+        replace(line, "{code}", std::to_string(INJECTED));
+        replace(line, "{text}", INJECTED_TEXT);
+        replace(line, "{info}", info);
+    }
+    return lines;
+}
+
+long openDescriptors()
+{
+    const std::filesystem::directory_iterator entries("/proc/self/fd");
+    return std::distance(begin(entries), end(entries));
+}
+
+bool hasLeaks()
+{
+#ifdef __SANITIZE_ADDRESS__
+    return __lsan_do_recoverable_leak_check() != 0;
+#else
+    return false;
+#endif
+}
+
+void runWithFailure(const Operation &operation, const std::vector<std::string> &clean, size_t n, const Failure &failure)
+{
+    start(operation);
+    fake::failCall(static_cast<uint32_t>(n), failureOf(clean[n - 1]));
+    const Outcome outcome = operation.run();
+    EXPECT_EQ(outcome.code, failure.code);
+    EXPECT_EQ(logged(), filledIn(failure.lines, outcome.info));
+    EXPECT_EQ(outcome.outputs, failure.outputs.empty() ? operation.untouched : failure.outputs);
+    EXPECT_EQ(fake::unfreedAnswers(), 0);
+    const auto names = callNames();
+    ASSERT_GE(names.size(), n);
+    EXPECT_TRUE(std::equal(clean.begin(), clean.begin() + static_cast<long>(n), names.begin()));
+    EXPECT_EQ(names.size() > n, failure.goes_on);
+}
+
+} // namespace
+
+TEST_P(FailureSweep, EveryFailingCallIsReported)
+{
+    const Operation &operation = GetParam();
+    start(operation);
+    const Outcome outcome = operation.run();
+    ASSERT_EQ(outcome.code, 0);
+    EXPECT_EQ(logged(), Lines());
+    const auto clean = callNames();
+    ASSERT_FALSE(clean.empty());
+
+    const long descriptors = openDescriptors();
+    std::set<const Failure *> seen;
+    for (size_t n = 1; n <= clean.size(); ++n) {
+        const std::string &call = clean[n - 1];
+        SCOPED_TRACE("call " + std::to_string(n) + " fails: " + call);
+        const auto occurrence = std::count(clean.begin(), clean.begin() + static_cast<long>(n), call);
+        const Failure *failure = find(operation, call, occurrence);
+        if (!failure) {
+            ADD_FAILURE() << "the table has no line for this call";
+            continue;
+        }
+        seen.insert(failure);
+        runWithFailure(operation, clean, n, *failure);
+    }
+    EXPECT_EQ(seen.size(), operation.failures.size()) << "the table has lines for calls that are not made";
+    EXPECT_EQ(openDescriptors(), descriptors);
+    EXPECT_FALSE(hasLeaks());
+}
+
+} // namespace unit

@@ -1,0 +1,95 @@
+#include "etc/Text.h"
+#include "etc/ISCSIWebAPIStringTool.h"
+#include "iscsiwebapi/ISCSILUNInfo.h"
+#include "tests/unit/Library.h"
+
+#include <unistd.h>
+
+#include <fstream>
+
+namespace unit {
+namespace {
+
+using ISCSI::FormatSize;
+using ISCSI::StringCopy;
+
+TEST(Text, SizesAreChainsOfBinaryUnits)
+{
+    const struct {
+        uint64_t bytes;
+        const char *text;
+    } cases[] = {
+        {0, "0bytes"},
+        {1, "1bytes"},
+        {1023, "1023bytes"},
+        {1024, "1KB"},
+        {1025, "1KB,1bytes"},
+        {1536, "1KB,512bytes"},
+        {1073741824, "1GB"},
+        {1610612739, "1GB,512MB,3bytes"},
+        {uint64_t{1} << 60, "1EB"},
+        {(uint64_t{1} << 50) + 1024, "1PB,1KB"},
+        {UINT64_MAX, "15EB,1023PB,1023TB,1023GB,1023MB,1023KB,1023bytes"},
+    };
+    for (const auto &c : cases)
+        EXPECT_EQ(FormatSize(c.bytes), c.text);
+}
+
+class StringCopyTest : public LibraryTest {};
+
+TEST_F(StringCopyTest, FillsAFieldToItsLastByteAndNoFurther)
+{
+    for (size_t size : {37u, 256u}) {
+        std::string field(size + 1, '#');
+        EXPECT_EQ(StringCopy(field.data(), size, std::string(size - 1, 'a')), 0);
+        EXPECT_EQ(field, std::string(size - 1, 'a') + '\0' + '#');
+        EXPECT_EQ(logged(), Lines());
+
+        const std::string too_long(size, 'b');
+        EXPECT_EQ(StringCopy(field.data(), size, too_long), 18990025);
+        EXPECT_EQ(field, std::string(size - 1, 'b') + '\0' + '#');
+        EXPECT_EQ(logged(), Lines{"StringCopy: Failed to copy string: " + too_long});
+    }
+}
+
+TEST_F(StringCopyTest, TakesAnythingThatStreamsAndNoNullDestination)
+{
+    char field[8];
+    EXPECT_EQ(StringCopy(field, sizeof(field), 12345), 0);
+    EXPECT_STREQ(field, "12345");
+    EXPECT_EQ(StringCopy(field, sizeof(field), "100%n%s"), 0);
+    EXPECT_STREQ(field, "100%n%s");
+    EXPECT_EQ(StringCopy(static_cast<char *>(nullptr), 8, "x"), 18990003);
+    EXPECT_EQ(logged(), Lines{"StringCopy: NULL destination pointer"});
+}
+
+using LogLineTest = LibraryTest;
+
+TEST_F(LogLineTest, HeadNamesTheFailingStep)
+{
+    _tag_iscsi_lun_ record{};
+    EXPECT_EQ(ISCSI::ISCSILUNInfo().loadFromConfig(record, 0), 18990530);
+    const auto lines = fake::logLines();
+    ASSERT_EQ(lines.size(), 1u);
+    char file[64], method[64];
+    int number = 0, end = 0;
+    ASSERT_EQ(sscanf(lines[0].text.c_str(), "%63[^:]:%d:%63s No LUN UUID%n", file, &number, method, &end), 3);
+    EXPECT_EQ(lines[0].text.size(), static_cast<size_t>(end));
+    EXPECT_STREQ(file, "etc/ISCSILUNInfo.cpp");
+    EXPECT_STREQ(method, "loadFromConfig");
+
+    std::ifstream source(std::string(ISCSIWEBAPI_SOURCE_DIR "/") + file);
+    std::string step;
+    while (number-- > 0)
+        std::getline(source, step);
+    EXPECT_NE(step.find("No LUN UUID"), std::string::npos) << step;
+}
+
+TEST_F(LogLineTest, SleepingCostsNothing)
+{
+    EXPECT_EQ(sleep(3600), 0u);
+    EXPECT_EQ(fake::secondsSlept(), 3600u);
+}
+
+} // namespace
+} // namespace unit

@@ -1,0 +1,205 @@
+#include "iscsiwebapi/ISCSILIBTarget.h"
+#include "tests/unit/Library.h"
+
+#include <cstring>
+
+namespace unit {
+namespace {
+
+using ISCSI::LIB::LIBTarget::ISCSILIBTarget;
+using Masking = std::map<std::string, ISCSI_TARGET_AUTHORITY>;
+
+constexpr auto NONE = NORV_AUTHORITY_NONE;
+constexpr auto READ = NORV_AUTHORITY_READ;
+constexpr auto READ_WRITE = NORV_AUTHORITY_READ_WRITE;
+
+const std::string LONGEST_IQN(255, 'q');
+const std::string TOO_LONG_IQN(256, 'q');
+
+class MaskingTest : public LibraryTest {};
+
+TEST_F(MaskingTest, PermissionsAreThreeExactTexts)
+{
+    ISCSI_TARGET_AUTHORITY out = NONE;
+    EXPECT_EQ(ISCSILIBTarget::GetMaskingPermission("rw", out), 0);
+    EXPECT_EQ(out, 3);
+    EXPECT_EQ(ISCSILIBTarget::GetMaskingPermission("r", out), 0);
+    EXPECT_EQ(out, 1);
+    EXPECT_EQ(ISCSILIBTarget::GetMaskingPermission("-", out), 0);
+    EXPECT_EQ(out, 0);
+    out = READ_WRITE;
+    for (const char *text : {"", "RW", "R", "w", "wr", "rw ", "none", "--", "3"}) {
+        EXPECT_EQ(ISCSILIBTarget::GetMaskingPermission(text, out), 18990708) << text;
+        EXPECT_EQ(out, READ_WRITE);
+    }
+}
+
+TEST_F(MaskingTest, IsReadAsAMapWhereTheFirstOfARepeatedIQNWins)
+{
+    addTarget(5, "five").masking = {{"iqn.b", 1}, {"iqn.a", 3}, {"iqn.b", 0}, {"", 3}};
+    Masking masking = {{"before", READ}};
+    EXPECT_EQ(ISCSILIBTarget::GetTargetMasking(5, masking), 0);
+    EXPECT_EQ(masking, (Masking{{"", READ_WRITE}, {"iqn.a", READ_WRITE}, {"iqn.b", READ}}));
+    EXPECT_EQ(ISCSILIBTarget::GetTargetMasking(6, masking), 18990713);
+    EXPECT_EQ(masking.size(), 3u);
+    EXPECT_EQ(logged(), Lines{": GetTargetMasking(): NORViSCSITargetMaskingGet(6, vACLs) failed, err=No such target"});
+}
+
+TEST_F(MaskingTest, ConvertsToEntriesInKeyOrder)
+{
+    std::vector<_tag_struct_iscsi_acl_> entries(7);
+    EXPECT_EQ(
+        ISCSILIBTarget::TargetMaskMap2Vec(5, {{"iqn.b", READ}, {LONGEST_IQN, NONE}, {"iqn.a", READ_WRITE}}, entries),
+        0);
+    ASSERT_EQ(entries.size(), 3u);
+    const char *bytes = reinterpret_cast<const char *>(entries.data());
+    const auto number = [&](size_t offset) {
+        int32_t value;
+        memcpy(&value, bytes + offset, sizeof(value));
+        return value;
+    };
+    EXPECT_EQ(number(0), 5);
+    EXPECT_STREQ(bytes + 4, "iqn.a");
+    EXPECT_EQ(number(260), 3);
+    EXPECT_EQ(number(264), 0);
+    EXPECT_EQ(number(268), 0);
+    EXPECT_STREQ(bytes + 272 + 4, "iqn.b");
+    EXPECT_EQ(number(272 + 260), 1);
+    EXPECT_STREQ(bytes + 544 + 4, LONGEST_IQN.c_str());
+    EXPECT_EQ(number(544 + 260), 0);
+
+    EXPECT_EQ(ISCSILIBTarget::TargetMaskMap2Vec(5, {}, entries), 0);
+    EXPECT_TRUE(entries.empty());
+}
+
+TEST_F(MaskingTest, AnIQNThatDoesNotFitIsRefused)
+{
+    std::vector<_tag_struct_iscsi_acl_> entries(7);
+    EXPECT_EQ(ISCSILIBTarget::TargetMaskMap2Vec(5, {{"iqn.a", READ}, {TOO_LONG_IQN, READ}}, entries), 18990711);
+    EXPECT_EQ(entries.size(), 7u);
+    EXPECT_EQ(
+        logged(),
+        (Lines{"StringCopy: Failed to copy string: " + TOO_LONG_IQN,
+               "[E] TargetMaskMap2Vec: error code: 18990701 (Bad target iqn) [invalid iqn: " + TOO_LONG_IQN + "]"}));
+}
+
+// Setting a whole masking.
+
+struct SetCase {
+    const char *name;
+    std::vector<std::pair<std::string, int>> current;
+    const char *request;
+    Lines changes; ///< calls that change the masking
+};
+
+class SetMasking : public MaskingTest, public testing::WithParamInterface<SetCase> {};
+
+TEST_P(SetMasking, SendsTheDifference)
+{
+    addTarget(5, "five").masking = GetParam().current;
+    EXPECT_EQ(ISCSILIBTarget::ACLMasksSet(5, parsed(GetParam().request)), 0);
+    Lines expected = {"NORViSCSITargetMaskingGet(5)"};
+    expected.insert(expected.end(), GetParam().changes.begin(), GetParam().changes.end());
+    EXPECT_EQ(called(), expected);
+    EXPECT_EQ(logged(), Lines());
+}
+
+const SetCase set_cases[] = {
+    {"NothingOfNothing", {}, "[]", {}},
+    {"EqualNeedsNoCall",
+     {{"iqn.a", 3}, {"iqn.b", 0}},
+     R"([{"iqn": "iqn.b", "permission": "-"}, {"iqn": "iqn.a", "permission": "rw"}])",
+     {}},
+    {"CreateThenUpdateThenDelete",
+     {{"iqn.drop", 3}, {"iqn.change", 3}, {"iqn.drop2", 1}, {"iqn.keep", 1}},
+     R"([{"iqn": "iqn.keep", "permission": "r"}, {"iqn": "iqn.change", "permission": "r"},
+         {"iqn": "iqn.new", "permission": "-"}, {"iqn": "iqn.before", "permission": "rw"}])",
+     {"NORViSCSIMaskingsCreate(5, iqn.before=3 iqn.new=0)", "NORViSCSIMaskingsUpdate(5, iqn.change=1)",
+      "NORViSCSIMaskingsRemove(5, iqn.drop=3 iqn.drop2=1)"}},
+    {"EmptyDeletesAllButTheNameless",
+     {{"iqn.a", 3}, {"", 3}, {"iqn.b", 1}},
+     "[]",
+     {"NORViSCSIMaskingsRemove(5, iqn.a=3 iqn.b=1)"}},
+    {"TheNamelessAloneStays", {{"", 3}}, "[]", {}},
+    {"TheDefaultEntryIsAnEntryLikeOthers",
+     {{"iqn.2001-01.norv:default", 3}},
+     R"([{"iqn": "iqn.2001-01.norv:default", "permission": "-"}])",
+     {"NORViSCSIMaskingsUpdate(5, iqn.2001-01.norv:default=0)"}},
+    {"ElementsWithoutIQNAreIgnored",
+     {{"", 3}},
+     R"([{"iqn": "", "permission": "r"}, {"permission": "rw"}, {"iqn": "iqn.a", "permission": "r", "more": []}])",
+     {"NORViSCSIMaskingsCreate(5, iqn.a=1)"}},
+    {"TheLastOfARepeatedNewIQNCounts",
+     {},
+     R"([{"iqn": "iqn.a", "permission": "r"}, {"iqn": "iqn.a", "permission": "rw"}])",
+     {"NORViSCSIMaskingsCreate(5, iqn.a=3)"}},
+    {"CaseMakesAnotherIQN",
+     {{"iqn.a", 3}},
+     R"([{"iqn": "IQN.A", "permission": "rw"}])",
+     {"NORViSCSIMaskingsCreate(5, IQN.A=3)", "NORViSCSIMaskingsRemove(5, iqn.a=3)"}},
+    {"ARepeatedKnownIQNIsCreatedAgain",
+     {{"iqn.a", 1}},
+     R"([{"iqn": "iqn.a", "permission": "r"}, {"iqn": "iqn.a", "permission": "rw"}])",
+     {"NORViSCSIMaskingsCreate(5, iqn.a=3)"}},
+    {"ARepeatedChangedIQNIsCreatedAndUpdated",
+     {{"iqn.a", 1}},
+     R"([{"iqn": "iqn.a", "permission": "-"}, {"iqn": "iqn.a", "permission": "rw"}])",
+     {"NORViSCSIMaskingsCreate(5, iqn.a=3)", "NORViSCSIMaskingsUpdate(5, iqn.a=0)"}},
+};
+
+INSTANTIATE_TEST_SUITE_P(Requests, SetMasking, testing::ValuesIn(set_cases),
+                         [](const auto &set_case) { return std::string(set_case.param.name); });
+
+TEST_F(MaskingTest, BadRequestsChangeNothing)
+{
+    const struct {
+        int code;
+        const char *request;
+    } cases[] = {
+        {18990708, R"([{"iqn": "iqn.new", "permission": "rw"}, {"iqn": "iqn.x", "permission": "RW"}])"},
+        {18990708, R"([{"iqn": "iqn.new", "permission": "rw"}, {"iqn": "iqn.x"}])"},
+        {18990708, R"([{"iqn": "iqn.new", "permission": "rw"}, {"iqn": "", "permission": "x"}])"},
+        {18990708, R"([{}])"},
+        {18990201, "null"},
+        {18990201, "{}"},
+        {18990201, R"({"iqn": "iqn.new", "permission": "rw"})"},
+        {18990201, "\"iqn.new\""},
+        {18990201, "5"},
+        {18990201, R"([{"iqn": "iqn.new", "permission": "rw"}, null])"},
+        {18990201, R"([{"iqn": "iqn.new", "permission": "rw"}, []])"},
+        {18990201, R"([{"iqn": "iqn.new", "permission": "rw"}, 5])"},
+        {18990201, R"([{"iqn": "iqn.new", "permission": "rw"}, "rw"])"},
+        {18990201, R"([{"iqn": "iqn.new", "permission": "rw"}, {"iqn": 5, "permission": "rw"}])"},
+        {18990201, R"([{"iqn": "iqn.new", "permission": "rw"}, {"iqn": null, "permission": "rw"}])"},
+        {18990201, R"([{"iqn": "iqn.new", "permission": "rw"}, {"iqn": ["iqn.x"], "permission": "rw"}])"},
+        {18990201, R"([{"iqn": "iqn.new", "permission": "rw"}, {"iqn": "iqn.x", "permission": 3}])"},
+        {18990201, R"([{"iqn": "iqn.new", "permission": "rw"}, {"iqn": "iqn.x", "permission": {"rw": 1}}])"},
+    };
+    for (const auto &c : cases) {
+        addTarget(5, "five").masking = {{"iqn.a", 3}};
+        EXPECT_EQ(ISCSILIBTarget::ACLMasksSet(5, parsed(c.request)), c.code) << c.request;
+        for (const auto &call : called())
+            EXPECT_EQ(call, "NORViSCSITargetMaskingGet(5)") << c.request;
+        const Lines lines = logged();
+        if (c.code == 18990201) {
+            ASSERT_EQ(lines.size(), 1u) << c.request;
+            EXPECT_EQ(lines[0].find("[E] ACLMasksSet: error code: 18990201 (Invalid input) ["), 0u) << lines[0];
+        }
+    }
+}
+
+TEST_F(MaskingTest, ATooLongIQNStopsTheSequence)
+{
+    addTarget(5, "five").masking = {{"iqn.a", 3}};
+    Json::Value request(Json::arrayValue);
+    request.append(parsed(R"({"iqn": "iqn.new", "permission": "rw"})"));
+    request.append(parsed(R"({"permission": "r"})"));
+    request[1]["iqn"] = TOO_LONG_IQN;
+    EXPECT_EQ(ISCSILIBTarget::ACLMasksSet(5, request), 18990711);
+    EXPECT_EQ(called(), Lines{"NORViSCSITargetMaskingGet(5)"});
+    request[1]["iqn"] = LONGEST_IQN;
+    EXPECT_EQ(ISCSILIBTarget::ACLMasksSet(5, request), 0);
+}
+
+} // namespace
+} // namespace unit

@@ -1,0 +1,86 @@
+#include "iscsiwebapi/ISCSILIBTarget.h"
+#include "tests/unit/Library.h"
+
+namespace unit {
+namespace {
+
+using ISCSI::LIB::LIBTarget::ISCSILIBTarget;
+
+ISCSILIBTarget newTarget(bool is_enabled)
+{
+    return {
+        "new",        "iqn.2000-01.example:new", is_enabled, true, false, 262144, 4096, 8, 2, "alice", SECRET, "bob",
+        MUTUAL_SECRET};
+}
+
+class TargetOperations : public LibraryTest {};
+
+TEST_F(TargetOperations, CreateMasksBeforeItEnables)
+{
+    addTarget(1, "one");
+    for (bool is_enabled : {true, false}) {
+        fake::model().targets.erase(2);
+        ISCSILIBTarget target = newTarget(is_enabled);
+        EXPECT_EQ(target.createTarget(), 0);
+        EXPECT_EQ(called(), (Lines{"NORViSCSITargetCreate(new, iqn.2000-01.example:new, disabled)",
+                                   "NORViSCSIDefaultACLSet(2, 3)", "NORViSCSITargetEnable(2)"}));
+        EXPECT_EQ(target.info.tid, 2u);
+        const auto &created = fake::model().targets.at(2);
+        EXPECT_TRUE(created.record.enabled);
+        EXPECT_STREQ(created.record.password, SECRET);
+        EXPECT_STREQ(created.record.mutual_password, MUTUAL_SECRET);
+        EXPECT_EQ(created.masking.size(), 1u);
+    }
+}
+
+TEST_F(TargetOperations, CreateRefusesTextsThatDoNotFit)
+{
+    ISCSILIBTarget target = newTarget(true);
+    target.info.name = std::string(256, 'n');
+    EXPECT_EQ(target.createTarget(), 18990025);
+    Lines lines = logged();
+    ASSERT_EQ(lines.size(), 3u);
+    EXPECT_EQ(lines[2], "createTarget: Failed to fill ISCSI_TARGET. target: " + target.info.toString());
+
+    target = newTarget(true);
+    target.info.mutual_password = MUTUAL_SECRET + std::string(64, 'x');
+    EXPECT_EQ(target.createTarget(), 18990025);
+    EXPECT_EQ(logged().size(), 3u); // which fails the test if the secret is in a line
+    EXPECT_EQ(called(), Lines());
+}
+
+TEST_F(TargetOperations, CreateReplacesThePlatformsCode)
+{
+    addTarget(1, "new");
+    ISCSILIBTarget target = newTarget(true);
+    EXPECT_EQ(target.createTarget(), 18990714);
+    EXPECT_EQ(target.info.tid, 0u);
+    EXPECT_EQ(fake::model().targets.size(), 1u);
+}
+
+TEST_F(TargetOperations, DeleteLoadsTheTargetFirst)
+{
+    addTarget(5, "five");
+    EXPECT_EQ(ISCSILIBTarget(5).deleteTarget(), 0);
+    EXPECT_EQ(called(), (Lines{"NORViSCSIConfGet(0x1001, 5)", "NORViSCSITargetRemove(5)"}));
+
+    ISCSILIBTarget gone(5);
+    EXPECT_EQ(gone.deleteTarget(), 18990722);
+    EXPECT_EQ(logged(), (Lines{"loadFromConfig: No such target. target ID: 5",
+                               "deleteTarget: Failed to fill ISCSI_TARGET. info: " + gone.info.toString() +
+                                   ". error: 18990722 (Failed to load target)"}));
+    EXPECT_EQ(called(), Lines{"NORViSCSIConfGet(0x1001, 5)"});
+}
+
+TEST_F(TargetOperations, ListIsTheRecordsList)
+{
+    addTarget(5, "five");
+    std::vector<ISCSI::ISCSITargetInfo> targets;
+    EXPECT_EQ(ISCSILIBTarget::ListTarget(targets, ""), 0);
+    ASSERT_EQ(targets.size(), 1u);
+    EXPECT_EQ(targets[0].name, "five");
+    EXPECT_EQ(ISCSILIBTarget::ListTarget(targets, uuidOf(3)), 18990531);
+}
+
+} // namespace
+} // namespace unit

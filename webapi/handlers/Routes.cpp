@@ -1,0 +1,113 @@
+// The table: everything that can be asked for, by whom and with which input.
+#include "webapi/handlers/Handlers.h"
+
+#include "iscsiwebapi/ISCSIErrorCode.h"
+
+#include <cstdint>
+
+namespace webapi {
+namespace {
+
+using namespace ISCSI;
+
+constexpr bool REQUIRED = true;
+constexpr bool OPTIONAL = false;
+
+// What fits the SDK's records.
+constexpr uint64_t NAME_MAX_BYTES = 255;
+constexpr uint64_t LOCATION_MAX_BYTES = 4094;
+constexpr uint64_t CHAP_MAX_BYTES = 63;
+constexpr uint64_t IQN_MAX_BYTES = 223;     // RFC 7143, 4.2.7.1
+constexpr uint64_t SEGMENT_MIN_BYTES = 512; // RFC 7143, 13.12
+constexpr uint64_t SEGMENT_MAX_BYTES = (1 << 24) - 1;
+constexpr uint64_t MAX_TARGETS = 256;
+constexpr uint64_t MAX_MASKS = 1024; // bounds the work of one request
+
+constexpr Field LUN_LIST[] = {
+    {"status", Type::Boolean, OPTIONAL, 0, 0, 0},
+};
+
+constexpr Field LUN_CREATE[] = {
+    {"name", Type::Text, REQUIRED, 1, NAME_MAX_BYTES, ERR_BAD_LUN_NAME},
+    {"type", Type::Unsigned, REQUIRED, 1, INT32_MAX, ERR_BAD_LUN_TYPE},
+    {"location", Type::Text, REQUIRED, 1, LOCATION_MAX_BYTES, ERR_BAD_LUN_LOCATION},
+    {"size", Type::Unsigned, REQUIRED, 1, INT64_MAX, ERR_BAD_LUN_SIZE},
+    {"extent_size", Type::Unsigned, OPTIONAL, 1, UINT32_MAX, ERR_BAD_LUN_EXTENT_SIZE},
+};
+
+constexpr Field LUN_UPDATE[] = {
+    {"name", Type::Text, OPTIONAL, 1, NAME_MAX_BYTES, ERR_BAD_LUN_NAME},
+    {"size", Type::Unsigned, OPTIONAL, 1, INT64_MAX, ERR_BAD_LUN_SIZE},
+};
+
+constexpr Field SELECTOR[] = {{"", Type::Text, REQUIRED, 1, NAME_MAX_BYTES, ERR_BAD_TARGET_ID}};
+constexpr Field LUN_MAPPING[] = {
+    {"targets", Type::List, REQUIRED, 1, MAX_TARGETS, ERR_BAD_TARGET_ID, nullptr, SELECTOR},
+};
+
+constexpr Field LUN_LOADING[] = {
+    {"is_for_trash", Type::Boolean, OPTIONAL, 0, 0, 0},
+};
+
+constexpr Field TARGET_LIST[] = {
+    {"lun", Type::Text, OPTIONAL, 1, NAME_MAX_BYTES, ERR_BAD_LUN_UUID},
+};
+
+constexpr Field TARGET_CREATE[] = {
+    {"name", Type::Text, REQUIRED, 1, NAME_MAX_BYTES, ERR_BAD_TARGET_NAME},
+    {"iqn", Type::Text, OPTIONAL, 1, IQN_MAX_BYTES, ERR_BAD_TARGET_IQN},
+    {"has_header_checksum", Type::Boolean, OPTIONAL, 0, 0, 0},
+    {"has_data_checksum", Type::Boolean, OPTIONAL, 0, 0, 0},
+    {"max_recv_seq_bytes", Type::Unsigned, OPTIONAL, SEGMENT_MIN_BYTES, SEGMENT_MAX_BYTES, ERR_BAD_PARAMETER},
+    {"max_send_seq_bytes", Type::Unsigned, OPTIONAL, SEGMENT_MIN_BYTES, SEGMENT_MAX_BYTES, ERR_BAD_PARAMETER},
+    {"max_sessions", Type::Unsigned, OPTIONAL, 0, UINT32_MAX, ERR_BAD_TARGET_MAX_SESSIONS},
+    {"user", Type::Text, OPTIONAL, 1, CHAP_MAX_BYTES, ERR_BAD_TARGET_USER},
+    {"password", Type::Text, OPTIONAL, 1, CHAP_MAX_BYTES, ERR_BAD_TARGET_PASSWORD},
+    {"mutual_user", Type::Text, OPTIONAL, 1, CHAP_MAX_BYTES, ERR_BAD_TARGET_MUTUAL_USER},
+    {"mutual_password", Type::Text, OPTIONAL, 1, CHAP_MAX_BYTES, ERR_BAD_TARGET_MUTUAL_PASSWORD},
+};
+
+constexpr Field MASK[] = {
+    {"iqn", Type::Text, REQUIRED, 1, IQN_MAX_BYTES, ERR_BAD_TARGET_IQN},
+    {"permission", Type::Text, REQUIRED, 1, 2, ERR_BAD_TARGET_AUTH_INFO, "rw|r|-"},
+};
+constexpr Field MASK_ELEMENT[] = {{"", Type::Object, REQUIRED, 0, 0, 0, nullptr, MASK}};
+constexpr Field IQN_ELEMENT[] = {{"", Type::Text, REQUIRED, 1, IQN_MAX_BYTES, ERR_BAD_TARGET_IQN}};
+
+constexpr Field MASKS_SET[] = {
+    {"masks", Type::List, REQUIRED, 0, MAX_MASKS, ERR_BAD_TARGET_ACL, nullptr, MASK_ELEMENT},
+};
+
+constexpr Field MASKS_CHANGE[] = {
+    {"add", Type::List, OPTIONAL, 0, MAX_MASKS, ERR_BAD_TARGET_ACL, nullptr, MASK_ELEMENT},
+    {"remove", Type::List, OPTIONAL, 0, MAX_MASKS, ERR_BAD_TARGET_ACL, nullptr, IQN_ELEMENT},
+};
+
+constexpr Fields NONE;
+
+} // namespace
+
+const std::vector<Route> &routes()
+{
+    static const std::vector<Route> table = {
+        {Method::Get, "/luns", Role::Viewer, LUN_LIST, listLuns},
+        {Method::Post, "/luns", Role::Admin, LUN_CREATE, createLun},
+        {Method::Get, "/luns/{lun}", Role::Viewer, NONE, showLun},
+        {Method::Patch, "/luns/{lun}", Role::Admin, LUN_UPDATE, updateLun},
+        {Method::Delete, "/luns/{lun}", Role::Admin, NONE, deleteLun},
+        {Method::Post, "/luns/{lun}/map", Role::Admin, LUN_MAPPING, mapLun},
+        {Method::Post, "/luns/{lun}/unmap", Role::Admin, LUN_MAPPING, unmapLun},
+        {Method::Post, "/luns/{lun}/load", Role::Admin, LUN_LOADING, loadLun},
+        {Method::Post, "/luns/{lun}/unload", Role::Admin, LUN_LOADING, unloadLun},
+        {Method::Get, "/targets", Role::Viewer, TARGET_LIST, listTargets},
+        {Method::Post, "/targets", Role::Admin, TARGET_CREATE, createTarget},
+        {Method::Get, "/targets/{target}", Role::Viewer, NONE, showTarget},
+        {Method::Delete, "/targets/{target}", Role::Admin, NONE, deleteTarget},
+        {Method::Get, "/targets/{target}/masks", Role::Viewer, NONE, showMasks},
+        {Method::Put, "/targets/{target}/masks", Role::Admin, MASKS_SET, setMasks},
+        {Method::Patch, "/targets/{target}/masks", Role::Admin, MASKS_CHANGE, changeMasks},
+    };
+    return table;
+}
+
+} // namespace webapi
