@@ -90,6 +90,56 @@ CREATE TABLE retention_policies (
     PRIMARY KEY (kind, key)
 ) STRICT, WITHOUT ROWID;
 )sql",
+
+    R"sql(
+-- The snapshot that an unfinished restore sets the LUN's data back to; empty for none.
+ALTER TABLE luns ADD COLUMN restoring_uuid TEXT NOT NULL DEFAULT '';
+
+-- The loaded number is the LUN number of a snapshot that initiators may read, NULL while they may not.
+CREATE TABLE snapshots (
+    lid INTEGER NOT NULL REFERENCES luns ON DELETE RESTRICT,
+    snap_id INTEGER NOT NULL CHECK (snap_id BETWEEN 1 AND 256),
+    uuid TEXT NOT NULL UNIQUE,
+    name TEXT NOT NULL,
+    status TEXT NOT NULL,
+    description TEXT NOT NULL,
+    taken_by TEXT NOT NULL,
+    version TEXT NOT NULL,
+    create_time INTEGER NOT NULL,
+    snap_time INTEGER NOT NULL,
+    flags INTEGER NOT NULL,
+    app_consistent INTEGER NOT NULL CHECK (app_consistent IN (0, 1)),
+    user_locked INTEGER NOT NULL CHECK (user_locked IN (0, 1)),
+    total_size INTEGER NOT NULL,
+    mapped_size INTEGER NOT NULL,
+    loaded_number INTEGER UNIQUE,
+    PRIMARY KEY (lid, snap_id),
+    UNIQUE (lid, name)
+) STRICT;
+
+CREATE TABLE snapshot_app_keys (
+    uuid TEXT NOT NULL REFERENCES snapshots (uuid) ON DELETE CASCADE,
+    key TEXT NOT NULL,
+    PRIMARY KEY (uuid, key)
+) STRICT, WITHOUT ROWID;
+
+CREATE TABLE events (
+    id INTEGER PRIMARY KEY AUTOINCREMENT,
+    time INTEGER NOT NULL,
+    scope INTEGER NOT NULL,
+    level INTEGER NOT NULL,
+    number INTEGER NOT NULL,
+    text1 TEXT NOT NULL DEFAULT '',
+    text2 TEXT NOT NULL DEFAULT '',
+    text3 TEXT NOT NULL DEFAULT '',
+    text4 TEXT NOT NULL DEFAULT ''
+) STRICT;
+
+-- Times in seconds since the epoch, 0 = not yet; the options are a JSON object.
+ALTER TABLE schedules ADD COLUMN next_run INTEGER NOT NULL DEFAULT 0;
+ALTER TABLE schedules ADD COLUMN last_run INTEGER NOT NULL DEFAULT 0;
+ALTER TABLE schedules ADD COLUMN options TEXT NOT NULL DEFAULT '{}';
+)sql",
 };
 
 constexpr int latest = static_cast<int>(std::size(steps));
