@@ -6,10 +6,25 @@
 namespace cli {
 namespace {
 
-constexpr char FOOTER[] =
-    "A LUN is selected by its name, its UUID or its place in the list (lun#1), a target by its name, its ID or its\n"
-    "place in the list (tg#1). Sizes are bytes, or take a binary unit: 512M, 1.5G, 10T.\n"
-    "Exit status: 0 done, 1 failed, 2 wrong arguments.";
+constexpr char FOOTER[] = "A LUN is selected by its name, its UUID or its place in the list (lun#1), a\n"
+                          "target by its name, its ID or its place in the list (tg#1). Sizes are bytes, or\n"
+                          "take a binary unit: 512M, 1.5G, 10T.\n"
+                          "Exit status: 0 done, 1 failed, 2 wrong arguments.";
+
+/// Help without the lists of options that need or exclude each other; the parser tells when it matters.
+class HelpFormatter : public CLI::Formatter {
+    std::string make_option_opts(const CLI::Option *option) const override
+    {
+        std::string text;
+        if (option->get_type_size() != 0 && !option->get_type_name().empty())
+            text += " " + option->get_type_name();
+        if (option->get_expected_max() > 1)
+            text += " ...";
+        if (option->get_required())
+            text += " (required)";
+        return text;
+    }
+};
 
 } // namespace
 
@@ -19,6 +34,7 @@ std::unique_ptr<Commands> makeCommands()
     CLI::App &app = commands->app;
     app.set_version_flag("--version", std::string("iscsictl ") + ISCSICTL_VERSION);
     app.footer(FOOTER);
+    app.formatter(std::make_shared<HelpFormatter>());
     app.require_subcommand(1);
     addLunVerbs(*commands);
     addTargetVerbs(*commands);
@@ -33,9 +49,9 @@ std::unique_ptr<Commands> makeCommands()
 CLI::App &addNoun(Commands &commands, const char *name, const char *description)
 {
     CLI::App &noun = *commands.app.add_subcommand(name, description);
+    noun.footer("");
     // One verb, so that what follows it is never taken for another.
     noun.require_subcommand(1);
-    noun.footer("");
     return noun;
 }
 
@@ -54,8 +70,7 @@ CLI::Option &addPositional(CLI::App &verb, const char *name, std::string &value,
 
 CLI::Option &addPositionals(CLI::App &verb, const char *name, std::vector<std::string> &values, const char *description)
 {
-    // Without "extra arguments" a value in brackets is a value and not a list.
-    return *verb.add_option(name, values, description)->required()->type_name("")->allow_extra_args(false);
+    return *verb.add_option(name, values, description)->required()->type_name("");
 }
 
 CLI::Option &addText(CLI::App &verb, const char *flags, const char *type, Json::Value &input, const char *key,

@@ -13,10 +13,17 @@ using webapi::Method;
 namespace {
 
 constexpr char KINDS[] = "adv|file|thin|sink|block";
+constexpr int BLOCK_TYPE = 1;
+constexpr char KINDS_HELP[] = "Kinds of LUN:\n"
+                              "  adv    sparse, with snapshots\n"
+                              "  file   allocated in full\n"
+                              "  thin   sparse\n"
+                              "  sink   like adv, written by a peer\n"
+                              "  block  a block device, which the location names; its size is the LUN's";
 constexpr struct {
     const char *name;
     int type;
-} LUN_TYPES[] = {{"adv", 15}, {"file", 3}, {"thin", 7}, {"sink", 31}, {"block", 1}};
+} LUN_TYPES[] = {{"adv", 15}, {"file", 3}, {"thin", 7}, {"sink", 31}, {"block", BLOCK_TYPE}};
 
 int typeNumber(const std::string &name)
 {
@@ -92,19 +99,20 @@ void addCreate(Commands &commands, CLI::App &noun)
 {
     auto a = std::make_shared<Arguments>();
     a->input["type"] = typeNumber("adv");
-    CLI::App &verb = addVerb(commands, noun, "create", "Create a LUN",
-                             [a] { printLun(request(Method::Post, "/luns", a->input), a->json, "Created"); });
+    CLI::App &verb = addVerb(commands, noun, "create", "Create a LUN", [a] {
+        if (a->input["type"] != BLOCK_TYPE && !a->input.isMember("size"))
+            throw UsageError{"--size is required"};
+        printLun(request(Method::Post, "/luns", a->input), a->json, "Created");
+    });
     addText(verb, "NAME", "", a->input, "name", "Name of the LUN").required();
-    addSize(verb, "--size", a->input, "size", "Size of the LUN; of the device for a block LUN").required();
-    addText(verb, "--location", "DIR", a->input, "location", "Volume that holds it, or the device of a block LUN")
-        .required();
+    addText(verb, "--location", "DIR", a->input, "location", "Volume that holds it, or block device").required();
+    addSize(verb, "--size", a->input, "size", "Size, for all kinds but block");
     verb.add_option_function<std::string>(
-            "--type", [a](const std::string &name) { a->input["type"] = typeNumber(name); },
-            "adv: sparse, with snapshots (the default); file: allocated in full; thin: sparse; sink: written by a "
-            "peer; block: a block device")
+            "--type", [a](const std::string &name) { a->input["type"] = typeNumber(name); }, "Kind of LUN (adv)")
         ->type_name(KINDS);
     addSize(verb, "--extent-size", a->input, "extent_size", "Extent size of an adv or sink LUN");
     addJson(verb, a->json);
+    verb.footer(KINDS_HELP);
 }
 
 void printList(const Json::Value &luns, bool status)
@@ -203,6 +211,7 @@ void addDelete(Commands &commands, CLI::App &noun)
     CLI::App &verb = addVerb(commands, noun, "delete", "Delete a LUN and its data", [a] {
         std::string path = lunPath(a->selector);
         if (!a->yes) {
+            requireTerminal();
             const Json::Value lun = request(Method::Get, path);
             const std::string name = shown(lun["name"].asString());
             if (!confirmed("Delete LUN " + name + " (" + sizeText(lun["size"]) + ") and all its data?"))

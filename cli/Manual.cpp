@@ -16,7 +16,7 @@ std::string roff(const std::string &text)
             out += "\\e";
         else if (c == '-')
             out += "\\-";
-        else if ((c == '.' || c == '\'') && out.empty())
+        else if ((c == '.' || c == '\'') && (out.empty() || out.back() == '\n'))
             out += std::string("\\&") + c;
         else
             out += c;
@@ -62,6 +62,8 @@ void addVerbs(std::string &text, const CLI::App &app, const std::string &path)
             if (option != sub->get_help_ptr())
                 text += ".TP\n" + optionText(*option) + "\n" + roff(option->get_description()) + ".\n";
         }
+        if (!sub->get_footer().empty())
+            text += ".PP\n.nf\n" + roff(sub->get_footer()) + "\n.fi\n";
     }
 }
 

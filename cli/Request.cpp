@@ -41,10 +41,14 @@ void printJson(const Json::Value &value)
     print(Json::writeString(writer, value) + "\n");
 }
 
-bool confirmed(const std::string &question)
+void requireTerminal()
 {
     if (!isatty(STDIN_FILENO))
         throw UsageError{"--yes is needed when there is no terminal to ask"};
+}
+
+bool confirmed(const std::string &question)
+{
     fprintf(stderr, "%s [y/N] ", question.c_str());
     char answer[16];
     return fgets(answer, sizeof(answer), stdin) && (answer[0] == 'y' || answer[0] == 'Y');

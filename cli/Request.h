@@ -32,7 +32,8 @@ std::string targetPath(const std::string &selector, const std::string &rest = ""
 void print(const std::string &text);
 void printJson(const Json::Value &value);
 
-/// Asks on the terminal; throws UsageError when there is none.
+/// Throws UsageError unless there is a terminal to confirm something at.
+void requireTerminal();
 bool confirmed(const std::string &question);
 
 } // namespace cli

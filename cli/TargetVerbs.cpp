@@ -174,6 +174,7 @@ void addDelete(Commands &commands, CLI::App &noun)
     CLI::App &verb = addVerb(commands, noun, "delete", "Delete a target and end its sessions; its LUNs stay", [a] {
         std::string path = targetPath(a->selector);
         if (!a->yes) {
+            requireTerminal();
             const Json::Value target = request(Method::Get, path);
             const std::string luns = std::to_string(target["luns"].size());
             const std::string name = shown(target["name"].asString());
@@ -186,6 +187,10 @@ void addDelete(Commands &commands, CLI::App &noun)
     addSelector(verb, *a);
     addYes(verb, a->yes);
 }
+
+constexpr char MASKS_HELP[] = "Permissions are rw (read and write), r (read only) and - (no access). An\n"
+                              "initiator is named by its IQN; the IQN 'default' stands for all initiators\n"
+                              "without an entry of their own, which are refused when there is none.";
 
 /// "IQN=rw" as the handlers take it. Only the last '=' separates.
 Json::Value mask(const char *flags, const std::string &text)
@@ -213,18 +218,13 @@ CLI::Option &addMasks(CLI::App &verb, const char *flags, Json::Value &input, con
 void addMasks(Commands &commands, CLI::App &noun)
 {
     auto a = std::make_shared<Arguments>();
-    CLI::App &verb = addVerb(commands, noun, "masks",
-                             "Show or change which initiators may use a target: rw, r (read only) or - (not at all). "
-                             "'default' stands for initiators that are not named; without it they are refused",
-                             [a] {
-                                 const Method method = a->input.isMember("masks") ? Method::Put
-                                                       : a->input.empty()         ? Method::Get
-                                                                                  : Method::Patch;
-                                 const Json::Value masks = request(method, targetPath(a->selector, "/masks"), a->input);
-                                 if (a->json)
-                                     return printJson(masks);
-                                 print(masksText(masks));
-                             });
+    CLI::App &verb = addVerb(commands, noun, "masks", "Show or change which initiators may use a target", [a] {
+        const Method method = a->input.isMember("masks") ? Method::Put : a->input.empty() ? Method::Get : Method::Patch;
+        const Json::Value masks = request(method, targetPath(a->selector, "/masks"), a->input);
+        if (a->json)
+            return printJson(masks);
+        print(masksText(masks));
+    });
     addSelector(verb, *a);
     CLI::Option &set = addMasks(verb, "--set", a->input, "masks", "Replace the whole masking; once for each entry");
     CLI::Option &add = addMasks(verb, "--add", a->input, "add", "Add an entry, or change its permission");
@@ -243,6 +243,7 @@ void addMasks(Commands &commands, CLI::App &noun)
         whole->excludes(&add)->excludes(&remove);
     set.excludes(&clear);
     addJson(verb, a->json);
+    verb.footer(MASKS_HELP);
 }
 
 } // namespace

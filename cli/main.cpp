@@ -21,6 +21,18 @@ std::string commandName(const CLI::App &app)
     return chosen.front()->get_name() + (rest.empty() ? "" : " " + rest);
 }
 
+/// What is wrong with words that do not parse. A word that is no noun or verb is named; the parser
+/// only says that one is missing.
+std::string parseProblem(const CLI::App &app, const CLI::ParseError &error)
+{
+    const auto chosen = app.get_subcommands();
+    if (!chosen.empty())
+        return parseProblem(*chosen.front(), error);
+    const auto unknown = app.remaining();
+    const bool wants_command = app.get_require_subcommand_min() > 0;
+    return wants_command && !unknown.empty() ? "there is no '" + unknown.front() + "' here" : error.what();
+}
+
 void complain(const std::string &command, const std::string &text)
 {
     fprintf(stderr, "iscsictl: %s%s%s\n", command.c_str(), command.empty() ? "" : ": ", cli::shown(text).c_str());
@@ -78,7 +90,7 @@ int runCommandLine(int argc, char **argv)
     } catch (const CLI::Success &asked_for_help) {
         return commands->app.exit(asked_for_help);
     } catch (const CLI::ParseError &e) {
-        return usageError(commandName(commands->app), e.what());
+        return usageError(commandName(commands->app), parseProblem(commands->app, e));
     } catch (const cli::UsageError &e) {
         return usageError(command, e.reason);
     } catch (const cli::Failure &e) {

@@ -1,6 +1,6 @@
 #!/usr/bin/env bash
 # world.sh BUILD_DIR COMMAND [ARG...]: runs a command on a throw-away appliance: own network, processes and mounts; the
-# build installed in an /usr that forgets; empty /tmp and /run; all of it gone when the command ends. The command starts in
+# build installed in an /usr that forgets; empty /tmp, /mnt and /run; all of it gone when the command ends. The command starts in
 # a copy of this tree's scripts, so that it works wherever the tree lies. Needs root.
 set -euo pipefail
 
@@ -21,6 +21,7 @@ fi
 mount -t overlay overlay -o lowerdir=/usr,upperdir=/run/world/upper,workdir=/run/world/work /usr
 cmake --install "$build" --prefix /usr >/run/world/install.log
 mount -t tmpfs -o mode=1777 tmpfs /tmp
+mount -t tmpfs -o mode=0755 tmpfs /mnt
 ip link set lo up
 
 export ISCSI_HOST_STATE=/run/world/state ISCSI_HOST_RUN=/run/iscsi-host

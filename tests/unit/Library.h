@@ -7,6 +7,7 @@
 #include <gtest/gtest.h>
 #include <json/value.h>
 
+#include <cstring>
 #include <string>
 #include <vector>
 
@@ -47,6 +48,20 @@ _tag_iscsi_lun_ recordOf(int lid);
 /// An enabled target in the fake's model, with CHAP in both directions.
 fake::Target &addTarget(int tid, const std::string &name);
 void addMapping(int tid, int lid, int mapping_index = 1);
+
+/// A field of an SDK record, by its place.
+template <class Value>
+Value at(const void *record, size_t offset)
+{
+    Value value;
+    memcpy(&value, static_cast<const char *>(record) + offset, sizeof(value));
+    return value;
+}
+
+inline const char *textAt(const void *record, size_t offset)
+{
+    return static_cast<const char *>(record) + offset;
+}
 
 Json::Value parsed(const std::string &json);
 

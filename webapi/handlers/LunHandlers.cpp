@@ -93,7 +93,7 @@ Result selectLun(const std::string &selector, std::string &uuid)
     if (selector.empty())
         return failed(ERR_NO_LUN_UUID, "");
     if (int err = ISCSILUNInfo::GetLUNUUID(selector, uuid))
-        return failed(err, err == ERR_BAD_LUN_UUID ? "no LUN has the UUID, name or index " + selector
+        return failed(err, err == ERR_BAD_LUN_UUID ? "no LUN has the UUID, name or index '" + selector + "'"
                                                    : iscsi_host_last_error());
     return {};
 }
@@ -127,6 +127,8 @@ Result listLuns(const Request &request)
 Result createLun(const Request &request)
 {
     const Json::Value &in = request.input;
+    if (in["type"].asInt() != NORV_LUN_TYPE_BLOCK && !in.isMember("size"))
+        return failed(ERR_INVALID_INPUT, "size: is missing");
     ISCSILIBLUN lun(in["name"].asString(), static_cast<_tag_iscsi_lun_type>(in["type"].asInt()),
                     in["location"].asString(), in["size"].asUInt64(), in["extent_size"].asUInt());
     if (int err = lun.createLUN())
@@ -144,8 +146,21 @@ Result updateLun(const Request &request)
     const Json::Value &in = request.input;
     if (in.empty())
         return failed(ERR_INVALID_INPUT, "nothing to change: neither name nor size is given");
-    return changeLun(request,
-                     [&](ISCSILIBLUN &lun) { return lun.updateLUN(in["name"].asString(), in["size"].asUInt64()); });
+    const unsigned long long size = in["size"].asUInt64();
+    unsigned long long present_size = 0;
+    Result result = changeLun(request, [&](ISCSILIBLUN &lun) {
+        const int err = lun.updateLUN(in["name"].asString(), size);
+        present_size = lun.info.size;
+        return err;
+    });
+    // What the library refuses by itself has no reason of the platform's.
+    if (result.code == ERR_BAD_LUN_SIZE && size < present_size)
+        result.reason = "size: the LUN has " + std::to_string(present_size) + " bytes and cannot shrink";
+    else if (result.code == ERR_DUPLICATED_LUN_NAME)
+        result.reason = "name: a LUN bears it already";
+    else if (result.code == ERR_BAD_LUN_TYPE)
+        result.reason = "a block LUN takes its size from its device and keeps its name";
+    return result;
 }
 
 Result deleteLun(const Request &request)

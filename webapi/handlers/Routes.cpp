@@ -31,7 +31,7 @@ constexpr Field LUN_CREATE[] = {
     {"name", Type::Text, REQUIRED, 1, NAME_MAX_BYTES, ERR_BAD_LUN_NAME},
     {"type", Type::Unsigned, REQUIRED, 1, INT32_MAX, ERR_BAD_LUN_TYPE},
     {"location", Type::Text, REQUIRED, 1, LOCATION_MAX_BYTES, ERR_BAD_LUN_LOCATION},
-    {"size", Type::Unsigned, REQUIRED, 1, INT64_MAX, ERR_BAD_LUN_SIZE},
+    {"size", Type::Unsigned, OPTIONAL, 1, INT64_MAX, ERR_BAD_LUN_SIZE}, // a block LUN has its device's
     {"extent_size", Type::Unsigned, OPTIONAL, 1, UINT32_MAX, ERR_BAD_LUN_EXTENT_SIZE},
 };
 

@@ -178,7 +178,7 @@ Result selectTarget(const std::string &selector, int &tid)
     const bool name = number && *rest != '\0';
     const int err = name ? ISCSITargetInfo::GetTIDByTargetName(selector, tid) : ISCSITargetInfo::GetTID(selector, tid);
     if (err == ERR_BAD_TARGET_ID || err == ERR_NO_SUCH_TARGET)
-        return failed(err, "no target has the ID, name or index " + selector);
+        return failed(err, "no target has the ID, name or index '" + selector + "'");
     return err ? failed(err) : Result{};
 }
 

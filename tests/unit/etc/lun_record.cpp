@@ -25,20 +25,6 @@ ISCSILUNInfo everyField()
     return {3, NORV_LUN_TYPE_ADV, 1234571490, GIB, uuidOf(3), "vol1", "/volume1", true, false, 65536, 1536, "normal"};
 }
 
-/// A field of an SDK record, by its place.
-template <class Value>
-Value at(const _tag_iscsi_lun_ &record, size_t offset)
-{
-    Value value;
-    memcpy(&value, reinterpret_cast<const char *>(&record) + offset, sizeof(value));
-    return value;
-}
-
-const char *textAt(const _tag_iscsi_lun_ &record, size_t offset)
-{
-    return reinterpret_cast<const char *>(&record) + offset;
-}
-
 class LUNRecord : public LibraryTest {};
 
 TEST_F(LUNRecord, RendersAsText)
@@ -87,18 +73,18 @@ TEST_F(LUNRecord, FillsTheSDKRecordAtItsOffsets)
     _tag_iscsi_lun_ record;
     memset(&record, 0xEE, sizeof(record));
     ASSERT_EQ(everyField().fillISCSILUN(record), 0);
-    EXPECT_EQ(at<int32_t>(record, 0), 3);
-    EXPECT_EQ(at<uint32_t>(record, 8), 0u);
-    EXPECT_EQ(at<uint32_t>(record, 16), 65536u);
-    EXPECT_EQ(at<uint64_t>(record, 24), GIB);
-    EXPECT_EQ(at<int32_t>(record, 32), 1234571490);
-    EXPECT_EQ(at<int32_t>(record, 36), 15);
-    EXPECT_STREQ(textAt(record, 44), uuidOf(3).c_str());
-    EXPECT_STREQ(textAt(record, 81), "");
-    EXPECT_STREQ(textAt(record, 118), "/volume1");
-    EXPECT_STREQ(textAt(record, 4213), "vol1");
+    EXPECT_EQ(at<int32_t>(&record, 0), 3);
+    EXPECT_EQ(at<uint32_t>(&record, 8), 0u);
+    EXPECT_EQ(at<uint32_t>(&record, 16), 65536u);
+    EXPECT_EQ(at<uint64_t>(&record, 24), GIB);
+    EXPECT_EQ(at<int32_t>(&record, 32), 1234571490);
+    EXPECT_EQ(at<int32_t>(&record, 36), 15);
+    EXPECT_STREQ(textAt(&record, 44), uuidOf(3).c_str());
+    EXPECT_STREQ(textAt(&record, 81), "");
+    EXPECT_STREQ(textAt(&record, 118), "/volume1");
+    EXPECT_STREQ(textAt(&record, 4213), "vol1");
     for (size_t offset = 4213 + 5; offset < 4480; ++offset)
-        ASSERT_EQ(at<char>(record, offset), '\0') << offset;
+        ASSERT_EQ(at<char>(&record, offset), '\0') << offset;
 }
 
 TEST_F(LUNRecord, ReadsTheSDKRecordAndLeavesTheLiveState)
@@ -144,8 +130,8 @@ TEST_F(LUNRecord, TextsThatDoNotFitAreRefusedInOrder)
         EXPECT_EQ(logged(),
                   (Lines{"StringCopy: Failed to copy string: " + lun.*c.field,
                          std::string("fillISCSILUN: Failed to copy LUN ") + c.name + ". lun: " + lun.toString()}));
-        EXPECT_EQ(at<char>(record, c.next_offset), '\0') << c.name;
-        EXPECT_EQ(at<uint64_t>(record, 24), GIB);
+        EXPECT_EQ(at<char>(&record, c.next_offset), '\0') << c.name;
+        EXPECT_EQ(at<uint64_t>(&record, 24), GIB);
     }
 }
 

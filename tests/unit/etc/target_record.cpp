@@ -20,19 +20,6 @@ ISCSITargetInfo everyField()
             "bob", MUTUAL_SECRET};
 }
 
-template <class Value>
-Value at(const _tag_iscsi_target_ &record, size_t offset)
-{
-    Value value;
-    memcpy(&value, reinterpret_cast<const char *>(&record) + offset, sizeof(value));
-    return value;
-}
-
-const char *textAt(const _tag_iscsi_target_ &record, size_t offset)
-{
-    return reinterpret_cast<const char *>(&record) + offset;
-}
-
 class TargetRecord : public LibraryTest {};
 
 TEST_F(TargetRecord, TextFormHasNoSecrets)
@@ -56,22 +43,22 @@ TEST_F(TargetRecord, FillsTheSDKRecordAtItsOffsets)
     record.reserved_5 = 0x55;
     record.reserved_8 = 0x88;
     ASSERT_EQ(everyField().fillISCSITARGET(record), 0);
-    EXPECT_EQ(at<int32_t>(record, 0), 5);
-    EXPECT_EQ(at<uint8_t>(record, 4), 1);
-    EXPECT_EQ(at<uint8_t>(record, 5), 0x55) << "not ours to touch";
-    EXPECT_EQ(at<uint8_t>(record, 6), 0);
-    EXPECT_EQ(at<uint8_t>(record, 7), 1);
-    EXPECT_EQ(at<uint8_t>(record, 8), 0);
-    EXPECT_STREQ(textAt(record, 9), "five");
-    EXPECT_STREQ(textAt(record, 265), "iqn.2000-01.example:five");
-    EXPECT_EQ(at<uint32_t>(record, 524), 262144u);
-    EXPECT_EQ(at<uint32_t>(record, 528), 4097u);
-    EXPECT_EQ(at<uint32_t>(record, 532), 8u);
-    EXPECT_EQ(at<uint32_t>(record, 536), 2u);
-    EXPECT_STREQ(textAt(record, 540), "alice");
-    EXPECT_STREQ(textAt(record, 604), SECRET);
-    EXPECT_STREQ(textAt(record, 668), "bob");
-    EXPECT_STREQ(textAt(record, 732), MUTUAL_SECRET);
+    EXPECT_EQ(at<int32_t>(&record, 0), 5);
+    EXPECT_EQ(at<uint8_t>(&record, 4), 1);
+    EXPECT_EQ(at<uint8_t>(&record, 5), 0x55) << "not ours to touch";
+    EXPECT_EQ(at<uint8_t>(&record, 6), 0);
+    EXPECT_EQ(at<uint8_t>(&record, 7), 1);
+    EXPECT_EQ(at<uint8_t>(&record, 8), 0);
+    EXPECT_STREQ(textAt(&record, 9), "five");
+    EXPECT_STREQ(textAt(&record, 265), "iqn.2000-01.example:five");
+    EXPECT_EQ(at<uint32_t>(&record, 524), 262144u);
+    EXPECT_EQ(at<uint32_t>(&record, 528), 4097u);
+    EXPECT_EQ(at<uint32_t>(&record, 532), 8u);
+    EXPECT_EQ(at<uint32_t>(&record, 536), 2u);
+    EXPECT_STREQ(textAt(&record, 540), "alice");
+    EXPECT_STREQ(textAt(&record, 604), SECRET);
+    EXPECT_STREQ(textAt(&record, 668), "bob");
+    EXPECT_STREQ(textAt(&record, 732), MUTUAL_SECRET);
 }
 
 TEST_F(TargetRecord, UnknownAuthTypesAreMarked)
@@ -129,7 +116,7 @@ TEST_F(TargetRecord, TextsThatDoNotFitAreRefusedInOrder)
         if (c.sentence) {
             EXPECT_EQ(lines[1], std::string("fillISCSITARGET: ") + c.sentence + ". target: " + target.toString());
         }
-        EXPECT_EQ(at<char>(record, c.next_offset), '\0') << "written behind the failing field";
+        EXPECT_EQ(at<char>(&record, c.next_offset), '\0') << "written behind the failing field";
         EXPECT_EQ(record.tid, 0);
         EXPECT_EQ(record.max_sessions, 0u);
     }

@@ -45,6 +45,13 @@ Outcome setMasking()
     return {code, "", masking};
 }
 
+Outcome list()
+{
+    std::vector<ISCSI::ISCSITargetInfo> targets;
+    const int code = ISCSILIBTarget::ListTarget(targets, "");
+    return {code, "", std::to_string(targets.size())};
+}
+
 const Failure no_masking = stops("NORViSCSITargetMaskingGet", INJECTED,
                                  ": GetTargetMasking(): NORViSCSITargetMaskingGet(5, vACLs) failed, err={text}");
 
@@ -60,6 +67,8 @@ const Operation operations[] = {
                     standard("deleteTarget", "Failed to fill ISCSI_TARGET", "18990722 (Failed to load target)")),
               stops("NORViSCSITargetRemove", 18990720,
                     standard("deleteTarget", "Failed to delete target", "18990720 (Failed to delete target)"))),
+    operation("LIBTargetListTarget", maskedTarget, list, "0",
+              stops("NORViSCSIConfGet", 18990721, "ListTarget: Failed to list target. LUN UUID: ")),
     operation("GetTargetMasking", maskedTarget, getMasking, "before", no_masking),
     operation("ACLMasksSet", maskedTarget, setMasking, "iqn.keep=1 iqn.change=1 iqn.drop=3 ", no_masking,
               stops("NORViSCSIMaskingsCreate", 18990715,

@@ -52,21 +52,15 @@ TEST_F(MaskingTest, ConvertsToEntriesInKeyOrder)
         ISCSILIBTarget::TargetMaskMap2Vec(5, {{"iqn.b", READ}, {LONGEST_IQN, NONE}, {"iqn.a", READ_WRITE}}, entries),
         0);
     ASSERT_EQ(entries.size(), 3u);
-    const char *bytes = reinterpret_cast<const char *>(entries.data());
-    const auto number = [&](size_t offset) {
-        int32_t value;
-        memcpy(&value, bytes + offset, sizeof(value));
-        return value;
-    };
-    EXPECT_EQ(number(0), 5);
-    EXPECT_STREQ(bytes + 4, "iqn.a");
-    EXPECT_EQ(number(260), 3);
-    EXPECT_EQ(number(264), 0);
-    EXPECT_EQ(number(268), 0);
-    EXPECT_STREQ(bytes + 272 + 4, "iqn.b");
-    EXPECT_EQ(number(272 + 260), 1);
-    EXPECT_STREQ(bytes + 544 + 4, LONGEST_IQN.c_str());
-    EXPECT_EQ(number(544 + 260), 0);
+    EXPECT_EQ(at<int32_t>(entries.data(), 0), 5);
+    EXPECT_STREQ(textAt(entries.data(), 4), "iqn.a");
+    EXPECT_EQ(at<int32_t>(entries.data(), 260), 3);
+    EXPECT_EQ(at<int32_t>(entries.data(), 264), 0);
+    EXPECT_EQ(at<int32_t>(entries.data(), 268), 0);
+    EXPECT_STREQ(textAt(entries.data(), 272 + 4), "iqn.b");
+    EXPECT_EQ(at<int32_t>(entries.data(), 272 + 260), 1);
+    EXPECT_STREQ(textAt(entries.data(), 544 + 4), LONGEST_IQN.c_str());
+    EXPECT_EQ(at<int32_t>(entries.data(), 544 + 260), 0);
 
     EXPECT_EQ(ISCSILIBTarget::TargetMaskMap2Vec(5, {}, entries), 0);
     EXPECT_TRUE(entries.empty());

@@ -49,15 +49,6 @@ TEST_F(TargetOperations, CreateRefusesTextsThatDoNotFit)
     EXPECT_EQ(called(), Lines());
 }
 
-TEST_F(TargetOperations, CreateReplacesThePlatformsCode)
-{
-    addTarget(1, "new");
-    ISCSILIBTarget target = newTarget(true);
-    EXPECT_EQ(target.createTarget(), 18990714);
-    EXPECT_EQ(target.info.tid, 0u);
-    EXPECT_EQ(fake::model().targets.size(), 1u);
-}
-
 TEST_F(TargetOperations, DeleteLoadsTheTargetFirst)
 {
     addTarget(5, "five");
@@ -70,16 +61,6 @@ TEST_F(TargetOperations, DeleteLoadsTheTargetFirst)
                                "deleteTarget: Failed to fill ISCSI_TARGET. info: " + gone.info.toString() +
                                    ". error: 18990722 (Failed to load target)"}));
     EXPECT_EQ(called(), Lines{"NORViSCSIConfGet(0x1001, 5)"});
-}
-
-TEST_F(TargetOperations, ListIsTheRecordsList)
-{
-    addTarget(5, "five");
-    std::vector<ISCSI::ISCSITargetInfo> targets;
-    EXPECT_EQ(ISCSILIBTarget::ListTarget(targets, ""), 0);
-    ASSERT_EQ(targets.size(), 1u);
-    EXPECT_EQ(targets[0].name, "five");
-    EXPECT_EQ(ISCSILIBTarget::ListTarget(targets, uuidOf(3)), 18990531);
 }
 
 } // namespace

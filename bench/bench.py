@@ -1,0 +1,126 @@
+#!/usr/bin/env python3
+"""Every benchmark, as ratios of what ours takes to what its peer takes. Runs inside demo/world.sh."""
+import json
+import os
+import re
+import statistics
+import subprocess
+import sys
+import time
+
+import conformance
+from machines import MIB, PLAIN_TARGET, VOLUME, PlainTgtd, appliance, make_lun, run
+
+HERE = os.path.dirname(os.path.abspath(__file__))
+misses = []
+
+
+def row(what, ours, peer, unit, ratio, limit=None):
+    verdict = "" if limit is None else f"  (limit {limit})" if ratio <= limit else f"  ABOVE {limit}"
+    if limit is not None and ratio > limit:
+        misses.append(what)
+    print(f"  {what:<44}{ours:>11.3f} {peer:>11.3f} {unit:<6}{ratio:>7.2f}{verdict}", flush=True)
+
+
+def heading(text):
+    print(f"\n{text}\n  {'':<44}{'ours':>11} {'peer':>11} {'':<6}{'ratio':>7}")
+
+
+def records():
+    heading("The library on the fake platform, beside the same work done by hand")
+    report = json.loads(run(f"{HERE}/bench_records", "--benchmark_format=json", "--benchmark_repetitions=9",
+                            "--benchmark_min_time=0.1", "--benchmark_report_aggregates_only=true",
+                            "--benchmark_enable_random_interleaving=true"))
+    median = {entry["run_name"]: entry["cpu_time"] / 1000 for entry in report["benchmarks"]
+              if entry["aggregate_name"] == "median"}
+    answer = median["platformAnswer"]
+    row("ListLUN, 1,024 LUNs", median["listLUN"], median["plainLoop"], "us", median["listLUN"] / median["plainLoop"], 1.5)
+    row("  the same without the platform's answer", median["listLUN"] - answer, median["plainLoop"] - answer, "us",
+        (median["listLUN"] - answer) / (median["plainLoop"] - answer))
+    for what, ours, peer in (("toString of one LUN", "recordToString", "plainToString"),
+                             ("toJsonFormat of one LUN", "recordToJson", "plainToJson")):
+        row(what, median[ours], median[peer], "us", median[ours] / median[peer])
+
+
+def alternate(ours, peer, rounds):
+    """Medians of two measurements taken in turn, so that what disturbs one disturbs the other."""
+    times = [(ours(), peer()) for _ in range(rounds)]
+    return [statistics.median(column) for column in zip(*times)]
+
+
+def seconds(*command, **options):
+    def measure():
+        start = time.perf_counter()
+        done = subprocess.run(command, stdout=subprocess.PIPE, stderr=subprocess.STDOUT, **options)
+        taken = time.perf_counter() - start
+        if done.returncode:
+            raise SystemExit(f"{' '.join(command)}: {done.stdout.decode(errors='replace')[-2000:]}")
+        return taken
+    return measure
+
+
+def listing(count=1024, targets=16):
+    heading(f"Whole processes with {count} LUNs mapped to {targets} targets")
+    for tid in range(1, targets + 1):
+        run("iscsictl", "target", "create", f"list{tid}", "--iqn", f"iqn.2026-01.com.example:list{tid}")
+    present = len(json.loads(run("iscsictl", "lun", "list", "--json")))
+    for number in range(count - present):
+        name = f"list-{number}"
+        run("iscsictl", "lun", "create", name, "--location", VOLUME, "--size", "16M")
+        run("iscsictl", "lun", "map", name, f"list{number % targets + 1}")
+    assert len(json.loads(run("iscsictl", "lun", "list", "--json"))) == count
+
+    with PlainTgtd() as plain:
+        for tid in range(2, targets + 1):
+            plain.admin("--op", "new", "--mode", "target", "--tid", str(tid), "-T", f"{PLAIN_TARGET}{tid}")
+        os.mkdir(f"{VOLUME}/plain-list")
+        for number in range(count):
+            path = f"{VOLUME}/plain-list/{number}"
+            with open(path, "wb") as file:
+                file.truncate(16 * MIB)
+            plain.admin("--op", "new", "--mode", "logicalunit", "--tid", str(number % targets + 1),
+                        "--lun", str(number // targets + 1), "-b", path)
+        show = ("tgtadm", "--lld", "iscsi", "--op", "show", "--mode", "target")
+        shown = run(*show, env=plain.environment)
+        assert len(re.findall(r"Backing store path: /", shown)) == count
+        for options, limit in (([], 2), (["--status"], None)):
+            command = ["iscsictl", "lun", "list", "--json", *options]
+            ours, peer = alternate(seconds(*command), seconds(*show, env=plain.environment), 15)
+            row(" ".join(command), ours * 1000, peer * 1000, "ms", ours / peer, limit)
+
+
+def transfers(size=512 * MIB):
+    heading("I/O through a LUN of ours, beside a plain tgtd's on the same volume (time of the same work)")
+    ours_url = make_lun("transfers", size, "transfers", "iqn.2026-01.com.example:transfers")
+    with PlainTgtd() as plain:
+        peer_url = plain.add(f"{VOLUME}/plain-transfers", size)
+
+        def work(*options):
+            bench = ("qemu-img", "bench", "-f", "raw", "-t", "none", *options)
+            return alternate(seconds(*bench, ours_url), seconds(*bench, peer_url), 9)
+
+        work("-w", "-c", str(size // (256 << 10)), "-s", "256k", "-d", "8")  # allocates both
+        for what, options in (
+                ("write, 256 KiB, 8 in flight", ("-w", "-c", "4000", "-s", "256k", "-d", "8")),
+                ("read, 256 KiB, 8 in flight", ("-c", "4000", "-s", "256k", "-d", "8")),
+                ("write, 4 KiB, 32 in flight", ("-w", "-c", "30000", "-s", "4k", "-d", "32", "-S", "68k")),
+                ("read, 4 KiB, 32 in flight", ("-c", "30000", "-s", "4k", "-d", "32", "-S", "68k"))):
+            ours, peer = work(*options)
+            row(what, ours, peer, "s", ours / peer)
+
+
+def main():
+    records()
+    with appliance("8G"):
+        transfers()
+        print("\nThe SCSI test suite (iscsi-test-cu, one process a suite)")
+        if conformance.compare():
+            misses.append("iscsi-test-cu")
+        listing()
+    if misses:
+        print(f"\nAbove the limit: {', '.join(misses)}")
+    return 1 if misses else 0
+
+
+if __name__ == "__main__":
+    sys.exit(main())

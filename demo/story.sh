@@ -1,0 +1,46 @@
+# shellcheck shell=bash
+# The verbs that the chapters are written in.
+
+# shellcheck disable=SC2034 # the chapters use them
+PORTAL=192.0.2.10
+
+title() { printf '\n%s\n%s\n' "$1" "${1//?/=}"; }
+tell() { printf '\n%s\n' "$*"; }
+
+indented() { sed 's/^/    /'; }
+
+# do_it COMMAND...: shows a command and what it prints; it has to succeed.
+do_it() {
+    printf '  $ %s\n' "$*"
+    "$@" 2>&1 | indented
+}
+
+# refused PATTERN COMMAND...: shows a command that has to fail and say so.
+refused() {
+    local pattern=$1 output
+    shift
+    printf '  $ %s\n' "$*"
+    if output=$("$@" 2>&1); then
+        indented <<<"$output"
+        wrong "this was to be refused"
+    fi
+    indented <<<"$output"
+    grep -qiE "$pattern" <<<"$output" || wrong "refused, but not with '$pattern'"
+}
+
+same() { # same WHAT A B
+    [[ $2 == "$3" ]] || wrong "$1: $2 is not $3"
+}
+
+wrong() {
+    printf '\nNOT AS TOLD: %s\n' "$*" >&2
+    exit 1
+}
+
+# as INITIATOR TARGET_IQN LUN: a LUN as qemu's iSCSI initiator is told of it.
+as() {
+    printf 'driver=raw,file.driver=iscsi,file.transport=tcp,file.portal=%s:3260,file.initiator-name=%s,file.target=%s,file.lun=%d' \
+        "$PORTAL" "$1" "$2" "$3"
+}
+
+checksum() { sha256sum "$1" | cut -d ' ' -f 1; }

@@ -1,0 +1,136 @@
+/// What a kill at any moment leaves: a whole LUN or none, no lock, nothing that the next command or the sweep does
+/// not put right.
+#include "HostTest.h"
+
+#include "host/state/Database.h"
+
+#include <chrono>
+#include <poll.h>
+#include <random>
+#include <sys/ptrace.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+namespace norvhost {
+namespace {
+
+struct KillTest : HostTest {
+    /// Kills a process of its own before the n-th system call of the work; false when the work ended before.
+    bool killAtSystemCall(int n, const std::function<int()> &work)
+    {
+        const pid_t child = inChild([&] {
+            if (openDatabase() != 0 || ptrace(PTRACE_TRACEME, 0, nullptr, nullptr) != 0)
+                return 99;
+            raise(SIGSTOP);
+            return work();
+        });
+        int status = 0;
+        // A call stops the process twice, as it begins and as it ends; the work changes nothing in between two calls.
+        for (int stops = 0;; ++stops) {
+            EXPECT_EQ(child, waitpid(child, &status, 0));
+            if (!WIFSTOPPED(status)) {
+                EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << "status " << status;
+                return false;
+            }
+            if (stops == 2 * n)
+                break;
+            ptrace(PTRACE_SYSCALL, child, nullptr, nullptr);
+        }
+        kill(child, SIGKILL);
+        waitpid(child, &status, 0);
+        return true;
+    }
+
+    /// Kills the work at each of its system calls, from the same beginning each time.
+    void killEverywhere(const std::function<void()> &prepare, const std::function<int()> &work)
+    {
+        int n = 0;
+        for (bool killed = true; killed && !HasFailure(); ++n) {
+            SCOPED_TRACE("killed at stop " + std::to_string(n));
+            prepare();
+            killed = killAtSystemCall(n, work);
+            expectNextCommandsWork();
+        }
+        EXPECT_LT(20, n) << "the work was not followed";
+    }
+
+    void expectNextCommandsWork()
+    {
+        iscsihost::SweepReport report;
+        ASSERT_EQ(0, iscsihost::sweep(report)) << iscsi_host_last_error();
+        EXPECT_TRUE(report.failed.empty());
+        EXPECT_TRUE(report.foreign.empty());
+        expectConsistent();
+
+        std::vector<_tag_iscsi_lun_> luns;
+        ASSERT_EQ(0, forEachLun([&](const LunRow &row) { luns.push_back(row.record); }));
+        for (_tag_iscsi_lun_ &lun : luns)
+            EXPECT_EQ(0, NORViSCSILunDelete(&lun)) << iscsi_host_last_error();
+        EXPECT_TRUE(files().empty());
+    }
+};
+
+TEST_F(KillTest, CreationKilledAtEverySystemCall)
+{
+    killEverywhere([] {},
+                   [this] {
+                       _tag_iscsi_lun_ lun = wanted("a", NORV_LUN_TYPE_FILE, MiB);
+                       return NORViSCSILunCreate(&lun);
+                   });
+}
+
+TEST_F(KillTest, DeletionKilledAtEverySystemCall)
+{
+    _tag_iscsi_lun_ lun;
+    killEverywhere([&] { lun = create("a"); }, [&] { return NORViSCSILunDelete(&lun); });
+}
+
+TEST_F(KillTest, RenameWithGrowthKilledAtEverySystemCall)
+{
+    _tag_iscsi_lun_ lun;
+    killEverywhere([&] { lun = create("a", NORV_LUN_TYPE_FILE); }, [&] { return update(lun, "b", 5 * MiB); });
+}
+
+TEST_F(KillTest, MoveToTheTrashKilledAtEverySystemCall)
+{
+    _tag_iscsi_lun_ lun;
+    killEverywhere(
+        [&] {
+            lun = create("a", NORV_LUN_TYPE_ADV);
+            lun.options = NORV_LUN_OPTION_TRASH;
+        },
+        [&] { return NORViSCSILunUnload(&lun); });
+}
+
+/// Several workers at once, killed whenever it comes.
+TEST_F(KillTest, RandomKillsOfManyWorkers)
+{
+    std::mt19937 random(std::random_device{}());
+    const auto busy = [this](int worker) {
+        for (int i = 0;; ++i) {
+            const std::string name = "lun-" + std::to_string(worker) + "-" + std::to_string(i);
+            _tag_iscsi_lun_ lun = wanted(name, i % 2 ? NORV_LUN_TYPE_ADV : NORV_LUN_TYPE_FILE, MiB);
+            if (NORViSCSILunCreate(&lun) != 0 || update(lun, name + "-renamed", 2 * MiB) != 0)
+                return 1;
+            lun.options = NORV_LUN_OPTION_TRASH;
+            if (NORViSCSILunUnload(&lun) != 0 || (i % 3 && NORViSCSILunDelete(&lun) != 0))
+                return 2;
+        }
+    };
+    for (int round = 0; round < 50 && !HasFailure(); ++round) {
+        std::vector<pid_t> workers;
+        closeDatabase();
+        for (int worker = 0; worker < 3; ++worker)
+            workers.push_back(inChild([&] { return busy(worker); }));
+        for (pid_t worker : workers) {
+            poll(nullptr, 0, static_cast<int>(random() % 30));
+            kill(worker, SIGKILL);
+            EXPECT_EQ(128 + SIGKILL, waitForChild(worker)) << "a worker failed before it was killed";
+        }
+        SCOPED_TRACE("round " + std::to_string(round));
+        expectNextCommandsWork();
+    }
+}
+
+} // namespace
+} // namespace norvhost

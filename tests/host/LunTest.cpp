@@ -1,0 +1,459 @@
+#include "HostTest.h"
+
+#include "host/core/Lock.h"
+#include "host/services/Schedules.h"
+#include "host/state/Database.h"
+#include "platform/extent_pool.h"
+#include "platform/retention.h"
+#include "platform/schedule.h"
+
+#include <cstring>
+#include <sys/stat.h>
+#include <unistd.h>
+
+namespace norvhost {
+namespace {
+
+struct LunTest : HostTest {
+    std::string dataFile(const std::string &name) { return volume + "/@iSCSITrg/" + name; }
+
+    uint64_t allocated(const std::string &path)
+    {
+        uint64_t size = 0;
+        EXPECT_EQ(0, NORVExtentPoolMapFileMappedSizeGet(path.c_str(), volume.c_str(), &size));
+        return size;
+    }
+
+    uint64_t fileSize(const std::string &path)
+    {
+        struct stat status = {};
+        EXPECT_EQ(0, stat(path.c_str(), &status)) << path;
+        return static_cast<uint64_t>(status.st_size);
+    }
+
+    void expectRefused(int code, _tag_iscsi_lun_ lun)
+    {
+        const _tag_iscsi_lun_ before = lun;
+        EXPECT_EQ(code, NORViSCSILunCreate(&lun)) << lun.name << " " << lun.size << " " << iscsi_host_last_error();
+        EXPECT_STRNE("", iscsi_host_last_error());
+        EXPECT_EQ(nullptr, strchr(iscsi_host_last_error(), '\n'));
+        EXPECT_EQ(0, memcmp(&before, &lun, sizeof lun)) << "the caller's record changed";
+        EXPECT_EQ(namedFiles(), files());
+    }
+};
+
+TEST_F(LunTest, EveryKindOfFileHasItsNameSizeAndAllocation)
+{
+    create("file", NORV_LUN_TYPE_FILE);
+    create("thin", NORV_LUN_TYPE_THIN);
+    create("adv", NORV_LUN_TYPE_ADV);
+    create("sink", NORV_LUN_TYPE_SINK);
+    create("k47", NORV_LUN_TYPE_47);
+    create("k71", NORV_LUN_TYPE_71);
+    create("k79", NORV_LUN_TYPE_79);
+
+    const std::set<std::string> expected = {dataFile("iSCSI_1_file_000"),        dataFile("iSCSI_2_thin_000"),
+                                            dataFile("iSCSI_3_Extent_adv_000"),  dataFile("iSCSI_4_Extent_sink_000"),
+                                            dataFile("iSCSI_5_Extent_k47_000"),  dataFile("iSCSI_6_k71_00000"),
+                                            dataFile("iSCSI_7_Extent_k79_00000")};
+    EXPECT_EQ(expected, files());
+    for (const std::string &path : files())
+        EXPECT_EQ(4 * MiB, fileSize(path)) << path;
+    EXPECT_GE(allocated(dataFile("iSCSI_1_file_000")), 4 * MiB);
+    EXPECT_LT(allocated(dataFile("iSCSI_2_thin_000")), MiB);
+    EXPECT_LT(allocated(dataFile("iSCSI_3_Extent_adv_000")), MiB);
+    expectConsistent();
+}
+
+TEST_F(LunTest, IsFoundByUuidNameAndId)
+{
+    create("first");
+    _tag_iscsi_lun_ made = create("second", NORV_LUN_TYPE_ADV, 8 * MiB);
+    EXPECT_EQ(2, made.lid);
+    EXPECT_EQ(36u, strlen(made.uuid));
+
+    _tag_iscsi_lun_ by_uuid = {}, by_name = {}, by_id = {};
+    std::string upper_case = made.uuid;
+    for (char &c : upper_case)
+        c = static_cast<char>(toupper(c));
+    EXPECT_EQ(0, NORViSCSILunConfigGetByUUID(upper_case.c_str(), &by_uuid, 0));
+    EXPECT_EQ(0, NORViSCSILunGetByLunName("second", &by_name));
+    EXPECT_EQ(0, NORViSCSILunGetByLunId(2, &by_id));
+    for (const _tag_iscsi_lun_ *found : {&by_uuid, &by_name, &by_id})
+        EXPECT_EQ(0, memcmp(&made, found, sizeof made));
+
+    _tag_iscsi_lun_ *all = nullptr;
+    size_t count = 0;
+    ASSERT_EQ(0, NORViSCSILunConfigGetAll(&all, &count));
+    ASSERT_EQ(2u, count);
+    EXPECT_STREQ("first", all[0].name);
+    EXPECT_STREQ("second", all[1].name);
+    free(all);
+
+    EXPECT_EQ(NORV_ERR_NO_SUCH_LUN, NORViSCSILunGetByLunName("Second", &by_name));
+    EXPECT_EQ(NORV_ERR_NO_SUCH_LUN, NORViSCSILunGetByLunId(3, &by_id));
+    EXPECT_EQ(NORV_ERR_NO_SUCH_FAMILY, [] {
+        _tag_iscsi_family_ family;
+        return NORViSCSIFamilyConfGetByLID(3, &family);
+    }());
+    EXPECT_EQ(NORV_ERR_NULL_POINTER, NORViSCSILunConfigGetByUUID(nullptr, &by_uuid, 0));
+}
+
+TEST_F(LunTest, BadNamesAreRefused)
+{
+    for (const char *name : {"",
+                             ".",
+                             "..",
+                             "a/b",
+                             "../../etc/passwd",
+                             "a\nb",
+                             "a\tb",
+                             "a'b",
+                             "a\"b",
+                             "a#1",
+                             "a,b",
+                             "a*",
+                             "a?",
+                             "[a]",
+                             "{a}",
+                             "a\\b",
+                             "a;b",
+                             "a$b",
+                             "a`b",
+                             "a|b",
+                             "a&b",
+                             "a<b",
+                             "~a",
+                             "!a",
+                             "%d",
+                             " a",
+                             "a ",
+                             "\x7f",
+                             "\xff",
+                             "\xc0\xaf",
+                             "\xed\xa0\x80",
+                             "\xf4\x90\x80\x80",
+                             "\xc3",
+                             "a\xe2\x80\xae",
+                             "a\xc2\xa0",
+                             "a\xe2\x80\x8b",
+                             "01234567-89ab-cdef-0123-456789ABCDEF"})
+        expectRefused(NORV_ERR_LUN_NAME, wanted(name));
+
+    // What the library lets through but no file name can hold; a device has no file.
+    expectRefused(NORV_ERR_LUN_NAME, wanted(std::string(255, 'n')));
+    expectRefused(NORV_ERR_LUN_NAME, wanted(std::string(234, 'n'), NORV_LUN_TYPE_ADV));
+
+    _tag_iscsi_lun_ endless = wanted("x");
+    memset(endless.name, 'n', sizeof endless.name);
+    expectRefused(NORV_ERR_BAD_PARAMETER, endless);
+}
+
+TEST_F(LunTest, GoodNamesAreKeptByteForByte)
+{
+    const std::string umlauts = "Gr\xc3\xb6\xc3\x9f"
+                                "e \xe6\x97\xa5\xe6\x9c\xac \xf0\x90\x8d\x88";
+    for (const std::string &name :
+         {std::string("a"), std::string("vol1"), std::string("DB (old) a_b-c.d:e@f+g=h"), umlauts})
+        EXPECT_STREQ(name.c_str(), reload(create(name)).name);
+    // The longest whose path still fits into what the readers of map files reserve.
+    const size_t room = map_file_path_size - 1 - (volume + "/@iSCSITrg/iSCSI_1024_Extent__000").size();
+    create(std::string(std::min<size_t>(room, 233), 'n'), NORV_LUN_TYPE_ADV);
+    expectConsistent();
+}
+
+TEST_F(LunTest, BadSizesKindsAndPlacesAreRefused)
+{
+    for (uint64_t size : {uint64_t(0), uint64_t(1), uint64_t(511), MiB - 512, MiB + 1, MiB + 511, uint64_t(1) << 63,
+                          UINT64_MAX, UINT64_MAX - 511})
+        for (int type : {NORV_LUN_TYPE_FILE, NORV_LUN_TYPE_THIN, NORV_LUN_TYPE_ADV})
+            expectRefused(NORV_ERR_LUN_SIZE, wanted("x", type, size));
+    // More than the volume holds, and more than a file of it can have.
+    expectRefused(NORV_ERR_OUT_OF_SPACE, wanted("x", NORV_LUN_TYPE_FILE, uint64_t(1) << 50));
+    expectRefused(NORV_ERR_LUN_SIZE, wanted("x", NORV_LUN_TYPE_THIN, uint64_t(INT64_MAX) - 511));
+
+    for (int type : {0, 2, 4, 5, 8, 16, 63, -1, 1 << 30})
+        expectRefused(NORV_ERR_LUN_TYPE, wanted("x", type));
+
+    _tag_iscsi_lun_ lun = wanted("x");
+    for (const std::string &place : {root, volume + "/", volume + "/../vol", volume + "/@iSCSITrg", std::string("vol"),
+                                     std::string(""), std::string("/nowhere")}) {
+        snprintf(lun.location, sizeof lun.location, "%s", place.c_str());
+        expectRefused(NORV_ERR_LUN_LOCATION, lun);
+    }
+    for (const char *device : {"/nowhere", "/dev/null", "dev/loop0", "/dev/../dev/null", "/etc/passwd", "/dev"}) {
+        lun.type = NORV_LUN_TYPE_BLOCK;
+        snprintf(lun.location, sizeof lun.location, "%s", device);
+        expectRefused(NORV_ERR_LUN_LOCATION, lun);
+    }
+    lun = wanted("x", NORV_LUN_TYPE_ADV);
+    lun.extent_size = 1000;
+    expectRefused(NORV_ERR_BAD_PARAMETER, lun);
+    EXPECT_TRUE(files().empty());
+}
+
+TEST_F(LunTest, NamesAreUniqueAndIdsAreReused)
+{
+    create("a");
+    _tag_iscsi_lun_ b = create("b");
+    create("c");
+    expectRefused(NORV_ERR_LUN_NAME_EXISTS, wanted("b"));
+    bool taken = false;
+    EXPECT_EQ(0, NORViSCSILunIsNameExist("b", &taken));
+    EXPECT_TRUE(taken);
+
+    EXPECT_EQ(0, NORViSCSILunDelete(&b)) << iscsi_host_last_error();
+    EXPECT_EQ(0, NORViSCSILunIsNameExist("b", &taken));
+    EXPECT_FALSE(taken);
+    const _tag_iscsi_lun_ again = create("b");
+    EXPECT_EQ(2, again.lid);
+    EXPECT_STRNE(b.uuid, again.uuid);
+    EXPECT_EQ(NORV_ERR_NO_SUCH_LUN, NORViSCSILunDelete(&b)) << "an old record must not hit the new LUN";
+    expectConsistent();
+}
+
+TEST_F(LunTest, NoMoreThan1024)
+{
+    // Rows alone for all but one: making a thousand files tells nothing more.
+    Query fill("WITH RECURSIVE ids (n) AS (SELECT 1 UNION ALL SELECT n + 1 FROM ids WHERE n < 1024) "
+               "INSERT INTO luns (lid, uuid, name, type, location, size) "
+               "SELECT n, 'uuid' || n, 'lun' || n, 7, ?1, 1048576 FROM ids WHERE n <> 777");
+    ASSERT_EQ(0, fill.bind(volume).run());
+    EXPECT_EQ(777, create("last").lid);
+    _tag_iscsi_lun_ more = wanted("more");
+    EXPECT_EQ(NORV_ERR_MAX_LUNS, NORViSCSILunCreate(&more));
+    _tag_iscsi_lun_ *all = nullptr;
+    size_t count = 0;
+    EXPECT_EQ(0, NORViSCSILunConfigGetAll(&all, &count));
+    EXPECT_EQ(1024u, count);
+    free(all);
+}
+
+TEST_F(LunTest, DeleteIsRefusedWhileMappedOrLocked)
+{
+    _tag_iscsi_lun_ lun = create("a", NORV_LUN_TYPE_ADV);
+    {
+        LunLock lock;
+        ASSERT_EQ(0, lock.take(lun.lid, NORV_LUN_SNAPSHOTTING));
+        EXPECT_EQ(NORV_ERR_LUN_LOCKED, NORViSCSILunDelete(&lun));
+        EXPECT_EQ(NORV_ERR_LUN_LOCKED, update(lun, "b", lun.size));
+        EXPECT_EQ(NORV_ERR_LUN_LOCKED, NORViSCSILunUnload(&lun));
+    }
+    map(lun);
+    EXPECT_EQ(NORV_ERR_LUN_MAPPED, NORViSCSILunDelete(&lun));
+    expectConsistent();
+    Query("DELETE FROM mappings").run();
+    EXPECT_EQ(0, NORViSCSILunDelete(&lun)) << iscsi_host_last_error();
+    EXPECT_TRUE(files().empty());
+}
+
+TEST_F(LunTest, DeleteTakesSchedulesAndRetentionAlong)
+{
+    _tag_iscsi_lun_ lun = create("a", NORV_LUN_TYPE_ADV);
+    int64_t backup = 0, snapshot = 0;
+    ASSERT_EQ(0, iscsihost::addSchedule("backup", lun.lid, "daily", backup));
+    ASSERT_EQ(0, iscsihost::addSchedule("snapshot", lun.lid, "hourly", snapshot));
+    ASSERT_EQ(0, iscsihost::setRetentionPolicy("Lun#", "1", "keep=3"));
+    EXPECT_EQ(NORV_ERR_FILE_EXISTS, iscsihost::addSchedule("backup", lun.lid, "weekly", backup));
+    EXPECT_EQ(NORV_ERR_NO_SUCH_LUN, iscsihost::addSchedule("backup", 9, "weekly", backup));
+    EXPECT_EQ(NORV_ERR_BAD_PARAMETER, iscsihost::addSchedule("other", lun.lid, "weekly", backup));
+
+    EXPECT_EQ(0, update(lun, "renamed", lun.size));
+    EXPECT_EQ(backup, NORViSCSILunTaskGetSchIDByName("renamed"));
+    EXPECT_EQ(-1, NORViSCSILunTaskGetSchIDByName("a"));
+    EXPECT_EQ(snapshot, ScheduleSnapshotTaskGetIDByLid(lun.lid));
+    EXPECT_EQ(0, NORVSchedTaskRemove(backup));
+    EXPECT_GT(0, NORVSchedTaskRemove(backup));
+
+    ASSERT_EQ(0, NORViSCSILunDelete(&lun)) << iscsi_host_last_error();
+    EXPECT_EQ(-1, ScheduleSnapshotTaskGetIDByLid(lun.lid));
+    Query policies("SELECT count(*) FROM retention_policies");
+    ASSERT_TRUE(policies.next());
+    EXPECT_EQ(0, policies.integer(0));
+    EXPECT_EQ(0, NORVRETENTIONRemovePolicy("Lun#", "1")) << "nothing to remove is no failure";
+}
+
+TEST_F(LunTest, RenameAndGrow)
+{
+    for (int type : {NORV_LUN_TYPE_FILE, NORV_LUN_TYPE_THIN, NORV_LUN_TYPE_ADV}) {
+        const _tag_iscsi_lun_ lun = create("old", type);
+        struct stat before, after;
+        ASSERT_EQ(0, stat(dataPath(lun).c_str(), &before));
+        ASSERT_EQ(0, update(lun, "new", 6 * MiB)) << iscsi_host_last_error();
+
+        const _tag_iscsi_lun_ changed = reload(lun);
+        EXPECT_STREQ("new", changed.name);
+        EXPECT_EQ(6 * MiB, changed.size);
+        ASSERT_EQ(0, stat(dataPath(changed).c_str(), &after));
+        EXPECT_EQ(before.st_ino, after.st_ino) << "a running service keeps its data";
+        EXPECT_EQ(6 * MiB, fileSize(dataPath(changed)));
+        if (type == NORV_LUN_TYPE_FILE) {
+            EXPECT_GE(allocated(dataPath(changed)), 6 * MiB);
+        }
+        expectConsistent();
+        _tag_iscsi_lun_ gone = changed;
+        EXPECT_EQ(0, NORViSCSILunDelete(&gone));
+    }
+}
+
+TEST_F(LunTest, RefusedUpdatesChangeNothing)
+{
+    create("other");
+    const _tag_iscsi_lun_ lun = create("a", NORV_LUN_TYPE_FILE);
+    EXPECT_EQ(NORV_ERR_LUN_NAME_EXISTS, update(lun, "other", 8 * MiB));
+    EXPECT_EQ(NORV_ERR_LUN_SIZE, update(lun, "b", 2 * MiB));
+    EXPECT_EQ(NORV_ERR_LUN_SIZE, update(lun, "b", 8 * MiB + 1));
+    EXPECT_EQ(NORV_ERR_LUN_NAME, update(lun, "b/c", 8 * MiB));
+    EXPECT_EQ(NORV_ERR_LUN_NAME, update(lun, "", 8 * MiB));
+    EXPECT_EQ(NORV_ERR_OUT_OF_SPACE, update(lun, "b", uint64_t(1) << 50));
+    EXPECT_EQ(0, update(lun, "a", lun.size)) << "an update to what is there";
+    const _tag_iscsi_lun_ same = reload(lun);
+    EXPECT_EQ(0, memcmp(&lun, &same, sizeof lun));
+    EXPECT_EQ(4 * MiB, fileSize(dataPath(lun)));
+    expectConsistent();
+}
+
+TEST_F(LunTest, TrashMovesTheFileAndBack)
+{
+    const _tag_iscsi_lun_ lun = create("a", NORV_LUN_TYPE_ADV);
+    _tag_iscsi_lun_ request = lun;
+    request.options |= NORV_LUN_OPTION_TRASH;
+    map(lun);
+    EXPECT_EQ(NORV_ERR_LUN_MAPPED, NORViSCSILunUnload(&request));
+    expectConsistent();
+    Query("DELETE FROM mappings").run();
+
+    ASSERT_EQ(0, NORViSCSILunUnload(&request)) << iscsi_host_last_error();
+    EXPECT_EQ(0, NORViSCSILunUnload(&request)) << "again is no failure";
+    EXPECT_TRUE(isInTrash(reload(lun)));
+    EXPECT_EQ((std::set<std::string>{volume + "/@EP_trash/iSCSI_1_Extent_a_000"}), files());
+    EXPECT_EQ("Healthy", health(lun));
+
+    _tag_iscsi_lun_ plain = lun;
+    EXPECT_EQ(NORV_ERR_LUN_NOT_LOADED, NORViSCSILunLoad(&plain));
+    EXPECT_EQ(0, update(lun, "b", 8 * MiB)) << iscsi_host_last_error();
+    expectConsistent();
+
+    ASSERT_EQ(0, NORViSCSILunLoad(&request)) << iscsi_host_last_error();
+    EXPECT_FALSE(isInTrash(reload(lun)));
+    EXPECT_EQ((std::set<std::string>{volume + "/@iSCSITrg/iSCSI_1_Extent_b_000"}), files());
+}
+
+TEST_F(LunTest, LoadAndUnloadAreStored)
+{
+    _tag_iscsi_lun_ lun = create("a");
+    const auto loaded = [&] {
+        LunRow row;
+        EXPECT_EQ(0, loadLunByLid(lun.lid, row));
+        return row.loaded;
+    };
+    EXPECT_TRUE(loaded());
+    EXPECT_EQ(0, NORViSCSILunUnload(&lun)) << iscsi_host_last_error();
+    EXPECT_FALSE(loaded());
+    lun.options = NORV_LUN_OPTION_UNSYNC_SIZE;
+    EXPECT_EQ(0, NORViSCSILunLoad(&lun)) << iscsi_host_last_error();
+    EXPECT_TRUE(loaded());
+    EXPECT_EQ(0u, reload(lun).options);
+}
+
+TEST_F(LunTest, MissingOrShortDataIsUnhealthyAndCanBeDeleted)
+{
+    _tag_iscsi_lun_ gone = create("gone"), cut = create("cut"), whole = create("whole");
+    ASSERT_EQ(0, unlink(dataPath(gone).c_str()));
+    ASSERT_EQ(0, truncate(dataPath(cut).c_str(), MiB));
+    EXPECT_EQ("Unhealthy", health(gone));
+    EXPECT_EQ("Unhealthy", health(cut));
+    EXPECT_EQ("Healthy", health(whole));
+
+    iscsihost::Status status;
+    ASSERT_EQ(0, iscsihost::status(status));
+    EXPECT_EQ(3, status.luns);
+    ASSERT_EQ(2u, status.unhealthy.size());
+    EXPECT_EQ("gone", status.unhealthy[0].name);
+
+    EXPECT_EQ(NORV_ERR_FILE_NOT_FOUND, update(gone, "gone", 8 * MiB));
+    EXPECT_EQ(NORV_ERR_FILE_NOT_FOUND, NORViSCSILunLoad(&gone));
+    EXPECT_EQ(0, NORViSCSILunDelete(&gone)) << iscsi_host_last_error();
+    EXPECT_EQ(0, NORViSCSILunDelete(&cut)) << iscsi_host_last_error();
+    expectConsistent();
+}
+
+TEST_F(LunTest, ProgressAndLockAreTheHoldersAndEndWithIt)
+{
+    const _tag_iscsi_lun_ lun = create("a");
+    int ready[2];
+    ASSERT_EQ(0, pipe(ready));
+    const pid_t holder = inChild([&] {
+        LunLock lock;
+        if (lock.take(lun.lid, NORV_LUN_CLONING) != 0)
+            return 1;
+        lock.tell(42);
+        if (write(ready[1], "x", 1) != 1)
+            return 1;
+        pause();
+        return 0;
+    });
+    char byte;
+    ASSERT_EQ(1, read(ready[0], &byte, 1));
+    bool locked = false;
+    _tag_iscsi_lun_progress_ progress = {};
+    EXPECT_EQ(0, NORViSCSILunIsLocked(&lun, &locked));
+    EXPECT_TRUE(locked);
+    EXPECT_EQ(0, NORViSCSILunProgressGet(&lun, &progress));
+    EXPECT_EQ(NORV_LUN_CLONING, progress.st);
+    EXPECT_EQ(42, progress.percent);
+
+    kill(holder, SIGKILL);
+    EXPECT_EQ(128 + SIGKILL, waitForChild(holder));
+    EXPECT_EQ(0, NORViSCSILunIsLocked(&lun, &locked));
+    EXPECT_FALSE(locked);
+    EXPECT_EQ(0, NORViSCSILunProgressGet(&lun, &progress));
+    EXPECT_EQ(NORV_LUN_IDLE, progress.st);
+    EXPECT_EQ(0, update(lun, "b", lun.size)) << iscsi_host_last_error();
+    close(ready[0]);
+    close(ready[1]);
+}
+
+TEST_F(LunTest, OneOfManyCreatorsGetsAName)
+{
+    std::vector<pid_t> creators;
+    for (int i = 0; i < 16; ++i)
+        creators.push_back(inChild([&] {
+            _tag_iscsi_lun_ lun = wanted("same", NORV_LUN_TYPE_FILE, MiB);
+            const int err = NORViSCSILunCreate(&lun);
+            return err == 0 ? 0 : err == NORV_ERR_LUN_NAME_EXISTS ? 1 : 2;
+        }));
+    int made = 0;
+    for (pid_t creator : creators) {
+        const int status = waitForChild(creator);
+        EXPECT_GE(1, status);
+        made += status == 0;
+    }
+    EXPECT_EQ(1, made);
+    EXPECT_EQ(1u, namedFiles().size());
+    expectConsistent();
+}
+
+TEST_F(LunTest, ManyCreatorsAndDeletersGetIdsOfTheirOwn)
+{
+    // Also the store's first opening is theirs: each child finds none.
+    std::vector<pid_t> workers;
+    for (int worker = 0; worker < 8; ++worker)
+        workers.push_back(inChild([&, worker] {
+            for (int i = 0; i < 8; ++i) {
+                _tag_iscsi_lun_ lun = wanted("lun-" + std::to_string(worker) + "-" + std::to_string(i));
+                if (NORViSCSILunCreate(&lun) != 0)
+                    return 1;
+                if (i % 2 && NORViSCSILunDelete(&lun) != 0)
+                    return 2;
+            }
+            return 0;
+        }));
+    for (pid_t worker : workers)
+        EXPECT_EQ(0, waitForChild(worker));
+    EXPECT_EQ(32u, namedFiles().size());
+    expectConsistent();
+}
+
+} // namespace
+} // namespace norvhost
