@@ -101,7 +101,6 @@ CREATE TABLE snapshots (
     snap_id INTEGER NOT NULL CHECK (snap_id BETWEEN 1 AND 256),
     uuid TEXT NOT NULL UNIQUE,
     name TEXT NOT NULL,
-    status TEXT NOT NULL,
     description TEXT NOT NULL,
     taken_by TEXT NOT NULL,
     version TEXT NOT NULL,
