@@ -17,12 +17,13 @@ struct LunAction {
     int percent = -1; ///< 0 to 100, -1 = cannot tell
 };
 
-/// The lock of one LUN ID, held until the object ends. A child made by fork() holds it too.
-class LunLock {
+/// A lock of an action, held until the object ends. A child made by fork() holds it too.
+class ActionLock {
 public:
-    /// Takes the lock without waiting and writes the action beside it. 0, NORV_ERR_LUN_LOCKED when
-    /// another action holds it, else an error code.
-    int take(int lid, int state);
+    ActionLock() = default;
+    ActionLock(ActionLock &&) = default;
+    ActionLock &operator=(ActionLock &&other) noexcept;
+    ~ActionLock() { release(); }
 
     /// Tells how far the action is, 0 to 100; -1 = cannot tell.
     void tell(int percent);
@@ -30,17 +31,56 @@ public:
     /// The action goes on as another one.
     void become(int state);
 
-    void release() { file.reset(); }
+    /// Whether the holder before this one was killed: what it left is to be put right.
+    bool foundUnfinished() const { return unfinished; }
+
+    /// Whether somebody wants this action to stop (see requestStop).
+    bool stopRequested() const;
+
+    void release();
+    /// After a fork() that made the action the child's: lets go of it without saying that it ended.
+    void leaveToChild() { file.reset(); }
     bool held() const { return static_cast<bool>(file); }
+
+protected:
+    /// Takes the lock without waiting and writes the action beside it. `busy` is returned when another holds it.
+    int take(const std::string &path, int state, int busy, const std::string &owner);
 
 private:
     FileDescriptor file;
     int action_state = 0;
+    bool unfinished = false;
+    std::string token; ///< names this holding of the lock
+};
+
+/// The lock of one LUN ID.
+class LunLock : public ActionLock {
+public:
+    /// 0, NORV_ERR_LUN_LOCKED when another action holds it, else an error code.
+    int take(int lid, int state);
+};
+
+/// The lock of one snapshot, for actions that need it to stay as it is. Whoever takes it with its LUN's lock takes
+/// that one first.
+class SnapshotLock : public ActionLock {
+public:
+    /// 0, NORV_ERR_SNAPSHOT_LOCKED when another action holds it, else an error code.
+    int take(int lid, int snap_id, int state);
 };
 
 /// Whether a LUN's lock is held now, by whichever process, and for what.
 int lunLockHeld(int lid, bool &held);
 int lunLockAction(int lid, LunAction &action);
+int snapshotLockHeld(int lid, int snap_id, bool &held);
+
+/// Asks the action that holds the lock now to stop; without effect on any later one, and 0 when there is none. The
+/// action decides whether it can.
+int requestLunStop(int lid);
+int requestSnapshotStop(int lid, int snap_id);
+
+/// Wait until nobody holds the lock, `limit` in seconds, 0 for none: NORV_ERR_TIMEOUT when it is still held then.
+int waitForLunLock(int lid, int limit);
+int waitForSnapshotLock(int lid, int snap_id, int limit);
 
 /// The lock of that name in the run folder, held until the object ends.
 class NamedLock {
