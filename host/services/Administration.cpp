@@ -1,5 +1,6 @@
 /// The functions of the public header.
 #include "host/core/LastError.h"
+#include "host/services/Events.h"
 #include "host/services/Retention.h"
 #include "host/services/Schedules.h"
 #include "host/state/Database.h"
@@ -171,9 +172,50 @@ int addSchedule(const std::string &kind, int lid, const std::string &rule, int64
     return norvhost::addSchedule(kind, lid, rule, id);
 }
 
-int setRetentionPolicy(const std::string &kind, const std::string &key, const std::string &policy)
+int listSchedules(std::vector<Schedule> &schedules)
 {
-    return norvhost::setRetentionPolicy(kind, key, policy);
+    return norvhost::listSchedules(schedules);
+}
+
+int removeSchedule(int64_t id)
+{
+    return norvhost::removeSchedule(id);
+}
+
+int runDueSchedules(std::vector<ScheduleRun> &runs)
+{
+    return norvhost::runDueSchedules(runs);
+}
+
+int setRetentionPolicy(int lid, const RetentionPolicy &policy)
+{
+    LunRow lun;
+    if (int err = loadLunByLid(lid, lun))
+        return err;
+    return norvhost::setRetentionPolicy(lun_retention_kind, std::to_string(lid), policy);
+}
+
+int getRetentionPolicy(int lid, RetentionPolicy &policy)
+{
+    LunRow lun;
+    if (int err = loadLunByLid(lid, lun))
+        return err;
+    bool found;
+    RetentionPolicy stored;
+    if (int err = loadRetentionPolicy(lun_retention_kind, std::to_string(lid), found, stored))
+        return err;
+    policy = stored;
+    return 0;
+}
+
+int removeRetentionPolicy(int lid)
+{
+    return norvhost::removeRetentionPolicy(lun_retention_kind, std::to_string(lid));
+}
+
+int listEvents(int64_t since, int64_t count, std::vector<Event> &events)
+{
+    return norvhost::listEvents(since, count, events);
 }
 
 } // namespace iscsihost

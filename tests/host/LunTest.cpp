@@ -253,7 +253,7 @@ TEST_F(LunTest, DeleteTakesSchedulesAndRetentionAlong)
     int64_t backup = 0, snapshot = 0;
     ASSERT_EQ(0, iscsihost::addSchedule("backup", lun.lid, "daily", backup));
     ASSERT_EQ(0, iscsihost::addSchedule("snapshot", lun.lid, "hourly", snapshot));
-    ASSERT_EQ(0, iscsihost::setRetentionPolicy("Lun#", "1", "keep=3"));
+    ASSERT_EQ(0, iscsihost::setRetentionPolicy(lun.lid, {3, 0, 0, 0}));
     EXPECT_EQ(NORV_ERR_FILE_EXISTS, iscsihost::addSchedule("backup", lun.lid, "weekly", backup));
     EXPECT_EQ(NORV_ERR_NO_SUCH_LUN, iscsihost::addSchedule("backup", 9, "weekly", backup));
     EXPECT_EQ(NORV_ERR_BAD_PARAMETER, iscsihost::addSchedule("other", lun.lid, "weekly", backup));

@@ -83,10 +83,98 @@ struct Status {
 
 ISCSI_HOST_API int status(Status &status);
 
-/// Stores a job of a LUN, of the kind "backup" or "snapshot", one of each for a LUN. It goes with its LUN.
+/// What the storage SDK has no call for on a snapshot, named by its UUID.
+
+/// A snapshot that its user locked is not deleted.
+ISCSI_HOST_API int setSnapshotUserLock(const std::string &uuid, bool locked);
+
+/// At most 1023 bytes.
+ISCSI_HOST_API int setSnapshotNote(const std::string &uuid, const std::string &note);
+
+/// A name that is free on the LUN, of the characters that LUN names may have.
+ISCSI_HOST_API int renameSnapshot(const std::string &uuid, const std::string &name);
+
+/// Jobs of LUNs. A LUN has at most one of each kind, and they go with it. What is due is run by
+/// `iscsi-host schedule run-due`, which a system timer or cron calls each minute.
+struct Schedule {
+    int64_t id = 0;
+    std::string kind; ///< "snapshot": takes a snapshot of the LUN; "backup": only looked up and removed here
+    int lid = 0;
+    std::string lun_name;
+    std::string rule;
+    int64_t next_run = 0; ///< seconds since the epoch
+    int64_t last_run = 0; ///< 0: did not run yet
+};
+
+/// Stores a job. The rule is
+/// - an interval, 1 minute to 1 year: "15m", "1h", "2d", "1w", counted from now;
+/// - five fields as cron has them, in local time: minute, hour, day of the month, month, day of the week; with ranges
+///   "1-5", lists "1,3", steps "*/15" and "0-30/10", names "jan", "mon"; day 7 is Sunday; a day comes when either of
+///   two restricted day fields says so; or
+/// - "hourly", "daily", "weekly" or "monthly".
+/// NORV_ERR_BAD_PARAMETER names the field that is wrong.
 ISCSI_HOST_API int addSchedule(const std::string &kind, int lid, const std::string &rule, int64_t &id);
 
-/// Stores the retention policy of an object, in place of an earlier one: kind "Lun#", key = the LUN ID in decimal.
-ISCSI_HOST_API int setRetentionPolicy(const std::string &kind, const std::string &key, const std::string &policy);
+/// Every schedule, ascending by ID.
+ISCSI_HOST_API int listSchedules(std::vector<Schedule> &schedules);
+
+ISCSI_HOST_API int removeSchedule(int64_t id);
+
+/// A job that run-due has run.
+struct ScheduleRun {
+    Schedule schedule;
+    int code = 0;       ///< 0, else an error code
+    std::string reason; ///< one line, empty when it succeeded
+};
+
+/// Claims the snapshot jobs that are due, so that no other caller runs them, and runs `iscsictl snapshot take` for
+/// each. Runs missed while the machine was off are one run. `runs` is set also when some of them failed, whose first
+/// code is returned then.
+ISCSI_HOST_API int runDueSchedules(std::vector<ScheduleRun> &runs);
+
+/// How many snapshots of a LUN are kept. Each rule keeps for itself; a snapshot goes when no rule keeps it. A locked
+/// snapshot and one from the future stay and do not count. A slot is an hour, day or week of local time, the week from
+/// Monday; only slots that have a snapshot count, and the newest in it is kept: a wrong clock deletes no more than a
+/// right one.
+struct RetentionPolicy {
+    int newest = 0; ///< the newest so many
+    int hourly = 0; ///< one of each of the latest so many hours
+    int daily = 0;
+    int weekly = 0;
+};
+
+/// Stores a LUN's policy in place of an earlier one. A policy without a rule is refused: it would keep nothing.
+ISCSI_HOST_API int setRetentionPolicy(int lid, const RetentionPolicy &policy);
+
+/// All zero for a LUN without a policy: it keeps all.
+ISCSI_HOST_API int getRetentionPolicy(int lid, RetentionPolicy &policy);
+
+ISCSI_HOST_API int removeRetentionPolicy(int lid);
+
+struct RetentionVerdict {
+    std::string uuid;
+    int snapshot_id = 0;
+    std::string name;
+    int64_t time = 0; ///< seconds since the epoch
+    bool kept = false;
+    std::string reason; ///< why it stays or goes
+};
+
+/// What the LUN's policy would do now, newest first; nothing is deleted. `policy` is tried in place of the stored one
+/// unless it is null.
+ISCSI_HOST_API int tryRetention(int lid, const RetentionPolicy *policy, std::vector<RetentionVerdict> &verdicts);
+
+/// An entry of the system event log. The newest 10,000 are kept.
+struct Event {
+    int64_t id = 0;   ///< ascending, never used twice
+    int64_t time = 0; ///< seconds since the epoch
+    int scope = 0;    ///< 1: the system's log, 9: the snapshot and replication log
+    int level = 0;    ///< 1: information, 2: warning, 3: error
+    unsigned number = 0;
+    std::string message; ///< one line
+};
+
+/// The newest `count` events with an ID above `since`, ascending by ID.
+ISCSI_HOST_API int listEvents(int64_t since, int64_t count, std::vector<Event> &events);
 
 } // namespace iscsihost

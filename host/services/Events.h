@@ -1,0 +1,14 @@
+/// The system event log: what administrators read of finished and failed actions.
+#pragma once
+
+#include "iscsihost/host.h"
+
+namespace norvhost {
+
+/// Older events go when newer ones come.
+constexpr int64_t kept_events = 10000;
+
+/// As iscsihost::listEvents().
+int listEvents(int64_t since, int64_t count, std::vector<iscsihost::Event> &events);
+
+} // namespace norvhost
