@@ -182,6 +182,12 @@ Query &Query::bind(std::string_view text)
     return *this;
 }
 
+Query &Query::bindNull()
+{
+    ++bound; // what is not bound is NULL
+    return *this;
+}
+
 bool Query::next()
 {
     if (code)

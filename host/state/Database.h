@@ -45,6 +45,7 @@ public:
     }
     /// The text must stay until the query ran.
     Query &bind(std::string_view text);
+    Query &bindNull();
 
     /// Goes to the next row: false after the last one and on failure, which error() tells apart.
     bool next();

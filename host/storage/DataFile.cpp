@@ -20,31 +20,10 @@ namespace {
 
 constexpr const char *store_attribute = "user.norv.store";
 constexpr const char *uuid_attribute = "user.norv.lun";
+constexpr const char *snapshot_attribute = "user.norv.snapshot";
 
 /// Allocation goes in steps of this, so that its progress can be told.
 constexpr uint64_t allocation_step = 1ull << 30;
-
-std::string parentOf(const std::string &path)
-{
-    return path.substr(0, path.rfind('/'));
-}
-
-int flushFolder(const std::string &folder)
-{
-    const FileDescriptor opened(open(folder.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-    if (!opened || fsync(opened.get()) != 0)
-        return failErrno(NORV_ERR_WRITE_FILE, errno, "cannot flush the folder %s", folder.c_str());
-    return 0;
-}
-
-int makeLunFolder(const std::string &folder)
-{
-    if (mkdir(folder.c_str(), 0700) == 0)
-        return flushFolder(parentOf(folder));
-    if (errno == EEXIST)
-        return 0;
-    return failErrno(NORV_ERR_MAKE_DIRECTORY, errno, "cannot make the folder %s", folder.c_str());
-}
 
 /// Sets the size, for a sparse file.
 int extendSparse(int fd, uint64_t size)
@@ -84,23 +63,7 @@ int extendAllocated(int fd, uint64_t from, uint64_t to, LunLock &progress)
 
 int extend(int fd, const _tag_iscsi_lun_ &lun, uint64_t from, uint64_t to, LunLock &progress)
 {
-    if (int err = isFullyAllocated(lun.type) ? extendAllocated(fd, from, to, progress) : extendSparse(fd, to))
-        return err;
-    if (fsync(fd) != 0)
-        return failErrno(NORV_ERR_WRITE_FILE, errno, "cannot flush the LUN's file");
-    return 0;
-}
-
-int writeFileMark(int fd, const _tag_iscsi_lun_ &lun)
-{
-    std::string store;
-    if (int err = storeIdentity(store))
-        return err;
-    const std::string uuid = lun.uuid;
-    if (fsetxattr(fd, store_attribute, store.data(), store.size(), 0) != 0 ||
-        fsetxattr(fd, uuid_attribute, uuid.data(), uuid.size(), 0) != 0)
-        return failErrno(NORV_ERR_WRITE_FILE, errno, "cannot mark the LUN's file with extended attributes");
-    return 0;
+    return isFullyAllocated(lun.type) ? extendAllocated(fd, from, to, progress) : extendSparse(fd, to);
 }
 
 std::string readTextAttribute(const std::string &path, const char *name)
@@ -112,21 +75,51 @@ std::string readTextAttribute(const std::string &path, const char *name)
 
 } // namespace
 
-int createDataFile(const _tag_iscsi_lun_ &lun, LunLock &progress)
+std::string parentOf(const std::string &path)
 {
-    const std::string folder = mapFileFolder(lun);
-    const std::string path = dataPath(lun);
-    if (int err = makeLunFolder(folder))
-        return err;
+    return path.substr(0, path.rfind('/'));
+}
 
+int flushFolder(const std::string &folder)
+{
+    const FileDescriptor opened(open(folder.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    if (!opened || fsync(opened.get()) != 0)
+        return failErrno(NORV_ERR_WRITE_FILE, errno, "cannot flush the folder %s", folder.c_str());
+    return 0;
+}
+
+int makeDataFolder(const std::string &folder)
+{
+    if (mkdir(folder.c_str(), 0700) == 0)
+        return flushFolder(parentOf(folder));
+    if (errno == EEXIST)
+        return 0;
+    return failErrno(NORV_ERR_MAKE_DIRECTORY, errno, "cannot make the folder %s", folder.c_str());
+}
+
+int writeFileMark(int fd, const std::string &uuid, const std::string &snapshot)
+{
+    std::string store;
+    if (int err = storeIdentity(store))
+        return err;
+    if (fsetxattr(fd, store_attribute, store.data(), store.size(), 0) != 0 ||
+        fsetxattr(fd, uuid_attribute, uuid.data(), uuid.size(), 0) != 0 ||
+        (!snapshot.empty() && fsetxattr(fd, snapshot_attribute, snapshot.data(), snapshot.size(), 0) != 0))
+        return failErrno(NORV_ERR_WRITE_FILE, errno, "cannot mark a data file with extended attributes");
+    return 0;
+}
+
+int makeFile(const std::string &path, const std::function<int(int fd)> &fill)
+{
+    const std::string folder = parentOf(path);
     // Without a name until it is complete: whoever is killed on the way leaves nothing.
     const FileDescriptor file(open(folder.c_str(), O_TMPFILE | O_RDWR | O_CLOEXEC, 0600));
     if (!file)
         return failErrno(NORV_ERR_OPEN_FILE, errno, "cannot make a file in %s", folder.c_str());
-    if (int err = writeFileMark(file.get(), lun))
+    if (int err = fill(file.get()))
         return err;
-    if (int err = extend(file.get(), lun, 0, lun.size, progress))
-        return err;
+    if (fsync(file.get()) != 0)
+        return failErrno(NORV_ERR_WRITE_FILE, errno, "cannot flush %s", path.c_str());
 
     const std::string nameless = "/proc/self/fd/" + std::to_string(file.get());
     if (linkat(AT_FDCWD, nameless.c_str(), AT_FDCWD, path.c_str(), AT_SYMLINK_FOLLOW) != 0)
@@ -139,17 +132,33 @@ int createDataFile(const _tag_iscsi_lun_ &lun, LunLock &progress)
     return 0;
 }
 
+int createDataFile(const _tag_iscsi_lun_ &lun, const std::function<int(int fd)> &fill)
+{
+    if (int err = makeDataFolder(mapFileFolder(lun)))
+        return err;
+    return makeFile(dataPath(lun), [&](int fd) {
+        const int err = writeFileMark(fd, lun.uuid, "");
+        return err ? err : fill(fd);
+    });
+}
+
+int createDataFile(const _tag_iscsi_lun_ &lun, LunLock &progress)
+{
+    return createDataFile(lun, [&](int fd) { return extend(fd, lun, 0, lun.size, progress); });
+}
+
 int growDataFile(const _tag_iscsi_lun_ &lun, uint64_t size, LunLock &progress)
 {
     const std::string path = dataPath(lun);
     const FileDescriptor file(open(path.c_str(), O_RDWR | O_NOFOLLOW | O_CLOEXEC));
     if (!file)
         return failErrno(NORV_ERR_OPEN_FILE, errno, "cannot open the LUN's file %s", path.c_str());
-    if (int err = extend(file.get(), lun, lun.size, size, progress)) {
+    int err = extend(file.get(), lun, lun.size, size, progress);
+    if (!err && fsync(file.get()) != 0)
+        err = failErrno(NORV_ERR_WRITE_FILE, errno, "cannot flush the LUN's file");
+    if (err)
         undoGrowth(lun);
-        return err;
-    }
-    return 0;
+    return err;
 }
 
 void undoGrowth(const _tag_iscsi_lun_ &lun)
@@ -161,7 +170,7 @@ void undoGrowth(const _tag_iscsi_lun_ &lun)
 int moveDataFile(const _tag_iscsi_lun_ &from, const _tag_iscsi_lun_ &to, const std::function<int()> &commit)
 {
     const std::string old_path = dataPath(from), new_path = dataPath(to);
-    if (int err = makeLunFolder(mapFileFolder(to)))
+    if (int err = makeDataFolder(mapFileFolder(to)))
         return err;
     if (link(old_path.c_str(), new_path.c_str()) != 0)
         return failErrno(errno == EEXIST   ? NORV_ERR_FILE_EXISTS
@@ -217,7 +226,8 @@ int checkData(const _tag_iscsi_lun_ &lun)
 
 FileMark readFileMark(const std::string &path)
 {
-    return {readTextAttribute(path, store_attribute), readTextAttribute(path, uuid_attribute)};
+    return {readTextAttribute(path, store_attribute), readTextAttribute(path, uuid_attribute),
+            readTextAttribute(path, snapshot_attribute)};
 }
 
 int freeDeviceSize(const std::string &path, uint64_t &size)

@@ -111,24 +111,22 @@ int checkVolume(_tag_iscsi_lun_ &lun)
     return 0;
 }
 
-} // namespace
-
-int checkLunName(std::string_view name)
+int checkName(int code, std::string_view name)
 {
     if (name.empty())
-        return fail(NORV_ERR_LUN_NAME, "the name is empty");
+        return fail(code, "the name is empty");
     if (name.size() > 255)
-        return fail(NORV_ERR_LUN_NAME, "the name has %zu bytes, 255 are allowed", name.size());
+        return fail(code, "the name has %zu bytes, 255 are allowed", name.size());
     if (name == "." || name == "..")
-        return fail(NORV_ERR_LUN_NAME, "the name is a folder's");
+        return fail(code, "the name is a folder's");
     if (name.front() == ' ' || name.back() == ' ')
-        return fail(NORV_ERR_LUN_NAME, "the name begins or ends with a space");
+        return fail(code, "the name begins or ends with a space");
     if (looksLikeUuid(name))
-        return fail(NORV_ERR_LUN_NAME, "the name looks like a UUID");
+        return fail(code, "the name looks like a UUID");
     for (std::string_view rest = name; !rest.empty();) {
         if (static_cast<unsigned char>(rest[0]) < 0x80) {
             if (!isAsciiAllowed(static_cast<unsigned char>(rest[0])))
-                return fail(NORV_ERR_LUN_NAME,
+                return fail(code,
                             "the name holds a character (code %d) that is not allowed: letters, digits, spaces inside "
                             "and . _ - : @ + = ( ) are",
                             rest[0]);
@@ -137,12 +135,46 @@ int checkLunName(std::string_view name)
         }
         uint32_t code_point;
         if (!takeCodePoint(rest, code_point))
-            return fail(NORV_ERR_LUN_NAME, "the name is not valid UTF-8");
+            return fail(code, "the name is not valid UTF-8");
         if (!isVisible(code_point))
-            return fail(NORV_ERR_LUN_NAME, "the name holds the invisible character U+%04X",
-                        static_cast<unsigned>(code_point));
+            return fail(code, "the name holds the invisible character U+%04X", static_cast<unsigned>(code_point));
     }
     return 0;
+}
+
+template <size_t size>
+bool terminated(const char (&text)[size])
+{
+    return memchr(text, '\0', size);
+}
+
+} // namespace
+
+int checkLunName(std::string_view name)
+{
+    return checkName(NORV_ERR_LUN_NAME, name);
+}
+
+int checkSnapshotName(const _tag_iscsi_snapshot_ &snapshot)
+{
+    if (int err = checkName(NORV_ERR_SNAPSHOT_NAME, snapshot.name))
+        return err;
+    const size_t room = snapshotNameRoom(snapshot.root_path), length = strlen(snapshot.name);
+    if (length > room)
+        return fail(NORV_ERR_SNAPSHOT_NAME, "the name has %zu bytes, %zu fit into the path of a snapshot on %s", length,
+                    room, snapshot.root_path);
+    return 0;
+}
+
+size_t snapshotNameRoom(const std::string &root_path)
+{
+    _tag_iscsi_snapshot_ longest = {};
+    longest.lid = NORV_LUN_ID_MAX;
+    longest.snap_id = NORV_SNAPSHOT_ID_MAX;
+    const size_t name_limit = map_file_name_size - 1, path_limit = map_file_path_size - 1;
+    snprintf(longest.root_path, sizeof longest.root_path, "%s", root_path.c_str());
+    const size_t name_used = snapshotFolderName(longest).size(), path_used = snapshotFolder(longest).size();
+    return std::min(name_limit - name_used, path_limit - std::min(path_limit, path_used));
 }
 
 int checkMapFileLength(const _tag_iscsi_lun_ &lun)
@@ -174,10 +206,15 @@ int checkLunSize(uint64_t size)
 
 int checkTerminated(const _tag_iscsi_lun_ &lun)
 {
-    const bool all = strnlen(lun.uuid, sizeof lun.uuid) < sizeof lun.uuid &&
-                     strnlen(lun.location, sizeof lun.location) < sizeof lun.location &&
-                     strnlen(lun.name, sizeof lun.name) < sizeof lun.name;
+    const bool all = terminated(lun.uuid) && terminated(lun.location) && terminated(lun.name);
     return all ? 0 : fail(NORV_ERR_BAD_PARAMETER, "a text of the LUN record does not end");
+}
+
+int checkTerminated(const _tag_iscsi_snapshot_ &snapshot)
+{
+    const bool all = terminated(snapshot.uuid) && terminated(snapshot.name) && terminated(snapshot.desc) &&
+                     terminated(snapshot.taken_by) && terminated(snapshot.root_path) && terminated(snapshot.version);
+    return all ? 0 : fail(NORV_ERR_BAD_PARAMETER, "a text of the snapshot record does not end");
 }
 
 int checkNewLun(_tag_iscsi_lun_ &lun)

@@ -3,61 +3,33 @@
 #include "host/core/LastError.h"
 #include "host/core/Lock.h"
 #include "host/storage/DataFile.h"
+#include "host/storage/LunActions.h"
 #include "host/storage/LunChecks.h"
 #include "host/storage/LunStore.h"
 #include "host/storage/MapFile.h"
+#include "host/storage/SnapshotFiles.h"
+#include "host/storage/SnapshotStore.h"
 #include "host/storage/Sweep.h"
 #include "host/target/Exports.h"
 #include "platform/error.h"
 #include "platform/iscsi_lun.h"
 
-#include <bitset>
-#include <cerrno>
 #include <cstdio>
-#include <unistd.h>
+#include <vector>
 
 using namespace norvhost;
 
 namespace {
 
-/// Finds a LUN ID that has neither row nor action, and locks it for the creation.
-int reserveLunId(LunLock &lock, int &lid)
+/// Locks every snapshot of a LUN that is to go.
+int lockSnapshots(int lid, std::vector<SnapshotRow> &snapshots, std::vector<SnapshotLock> &locks)
 {
-    std::bitset<NORV_LUN_ID_MAX + 1> used;
-    if (int err = forEachLun([&](const LunRow &row) { used.set(static_cast<size_t>(row.record.lid)); }))
+    if (int err = loadSnapshotsOfLun(lid, snapshots))
         return err;
-    for (lid = 1; lid <= NORV_LUN_ID_MAX; ++lid) {
-        if (used.test(static_cast<size_t>(lid)))
-            continue;
-        const int err = lock.take(lid, NORV_LUN_CREATING);
-        if (err == NORV_ERR_LUN_LOCKED)
-            continue;
-        if (err)
+    for (const SnapshotRow &snapshot : snapshots)
+        if (int err = locks.emplace_back().take(lid, snapshot.record.snap_id, NORV_LUN_DELETING))
             return err;
-        // Another creator may have come and gone since the rows were read.
-        LunRow row;
-        const int missing = loadLunByLid(lid, row);
-        if (missing == NORV_ERR_NO_SUCH_LUN)
-            return 0;
-        lock.release();
-        if (missing)
-            return missing;
-    }
-    return fail(NORV_ERR_MAX_LUNS, "there are %d LUNs or more are being created: that is the most", NORV_LUN_ID_MAX);
-}
-
-/// Locks the caller's LUN, then reads its row: what the caller's record says may be old.
-int lockLun(const _tag_iscsi_lun_ *lun, int action, LunLock &lock, LunRow &row)
-{
-    if (!lun)
-        return fail(NORV_ERR_NULL_POINTER, "no LUN record");
-    if (int err = checkTerminated(*lun))
-        return err;
-    if (int err = loadLunByUuid(lun->uuid, row))
-        return err;
-    if (int err = lock.take(row.record.lid, action))
-        return err;
-    return loadLunByUuid(lun->uuid, row);
+    return 0;
 }
 
 /// Moves the LUN into or out of the trash, when it is not there already, and stores its loaded mark.
@@ -150,26 +122,12 @@ int NORViSCSILunCreate(_tag_iscsi_lun_ *lun)
     row.record.restored_time = 0;
     if (int err = checkNewLun(row.record))
         return err;
-    bool name_taken;
-    if (int err = NORViSCSILunIsNameExist(row.record.name, &name_taken))
-        return err;
-    if (name_taken)
-        return fail(NORV_ERR_LUN_NAME_EXISTS, "another LUN is named '%s'", row.record.name);
-
     LunLock lock;
-    if (int err = reserveLunId(lock, row.record.lid))
+    const auto make_data = [&](const LunRow &made) {
+        return isBlock(made.record.type) ? 0 : createDataFile(made.record, lock);
+    };
+    if (int err = addLun(row, NORV_LUN_CREATING, lock, make_data))
         return err;
-    if (int err = sweepLun(row.record.lid))
-        return err;
-    snprintf(row.record.uuid, sizeof row.record.uuid, "%s", newUuid().c_str());
-    if (!isBlock(row.record.type))
-        if (int err = createDataFile(row.record, lock))
-            return err;
-    if (int err = insertLun(row)) {
-        if (!isBlock(row.record.type))
-            unlink(dataPath(row.record).c_str());
-        return err;
-    }
     *lun = row.record;
     return 0;
 }
@@ -180,11 +138,17 @@ int NORViSCSILunDelete(_tag_iscsi_lun_ *lun)
     LunRow row;
     if (int err = lockLun(lun, NORV_LUN_DELETING, lock, row))
         return err;
-    const std::string folder = mapFileFolder(row.record);
-    if (!isBlock(row.record.type) && access(folder.c_str(), W_OK) != 0 && errno != ENOENT)
-        return failErrno(NORV_ERR_NO_PERMISSION, errno, "cannot remove files from %s", folder.c_str());
+    if (!isBlock(row.record.type))
+        if (int err = checkRemovable(dataPath(row.record)))
+            return err;
+    std::vector<SnapshotRow> snapshots;
+    std::vector<SnapshotLock> locks;
+    if (int err = lockSnapshots(row.record.lid, snapshots, locks))
+        return err;
     if (int err = removeLun(row.record.lid))
         return err;
+    for (const SnapshotRow &snapshot : snapshots)
+        dropSnapshotData(snapshot.record);
     if (!isBlock(row.record.type))
         dropDataFile(dataPath(row.record));
     return 0;

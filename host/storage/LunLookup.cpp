@@ -3,6 +3,9 @@
 #include "host/core/Lock.h"
 #include "host/storage/DataFile.h"
 #include "host/storage/LunStore.h"
+#include "host/storage/Restore.h"
+#include "host/storage/SnapshotFiles.h"
+#include "host/storage/SnapshotStore.h"
 #include "platform/error.h"
 #include "platform/iscsi_lun.h"
 
@@ -19,6 +22,22 @@ int missingArgument(const char *function)
     return fail(NORV_ERR_NULL_POINTER, "%s: an argument is missing", function);
 }
 
+/// Whoever asks for a LUN goes on to use it: what a killed restore left is put right first.
+int answer(int err, LunRow &row, _tag_iscsi_lun_ *lun)
+{
+    if (err)
+        return err;
+    mendRestore(row);
+    *lun = row.record;
+    return 0;
+}
+
+bool isHealthy(const LunRow &row)
+{
+    const auto check = [](const SnapshotRow &snapshot) { return checkSnapshotData(snapshot.record); };
+    return checkData(row.record) == 0 && forEachSnapshot(row.record.lid, INT64_MIN, check) == 0;
+}
+
 } // namespace
 
 int NORViSCSILunConfigGetByUUID(const char *uuid, _tag_iscsi_lun_ *lun, int)
@@ -26,10 +45,7 @@ int NORViSCSILunConfigGetByUUID(const char *uuid, _tag_iscsi_lun_ *lun, int)
     if (!uuid || !lun)
         return missingArgument(__func__);
     LunRow row;
-    if (int err = loadLunByUuid(uuid, row))
-        return err;
-    *lun = row.record;
-    return 0;
+    return answer(loadLunByUuid(uuid, row), row, lun);
 }
 
 int NORViSCSILunConfigGetAll(_tag_iscsi_lun_ **luns, size_t *count)
@@ -42,6 +58,8 @@ int NORViSCSILunConfigGetAll(_tag_iscsi_lun_ **luns, size_t *count)
     if (!all)
         return fail(NORV_ERR_OUT_OF_MEMORY, "no memory for the LUN records");
     size_t found = 0;
+    if (int err = mendRestores())
+        return err;
     if (int err = forEachLun([&](const LunRow &row) { all.get()[found++] = row.record; }))
         return err;
     *luns = found ? all.release() : nullptr;
@@ -54,10 +72,7 @@ int NORViSCSILunGetByLunId(int lid, _tag_iscsi_lun_ *lun)
     if (!lun)
         return missingArgument(__func__);
     LunRow row;
-    if (int err = loadLunByLid(lid, row))
-        return err;
-    *lun = row.record;
-    return 0;
+    return answer(loadLunByLid(lid, row), row, lun);
 }
 
 int NORViSCSILunGetByLunName(const char *name, _tag_iscsi_lun_ *lun)
@@ -65,10 +80,7 @@ int NORViSCSILunGetByLunName(const char *name, _tag_iscsi_lun_ *lun)
     if (!name || !lun)
         return missingArgument(__func__);
     LunRow row;
-    if (int err = loadLunByName(name, row))
-        return err;
-    *lun = row.record;
-    return 0;
+    return answer(loadLunByName(name, row), row, lun);
 }
 
 int NORViSCSILunIsNameExist(const char *name, bool *exists)
@@ -114,6 +126,6 @@ int NORViSCSIFamilyConfGetByLID(int lid, _tag_iscsi_family_ *family)
         return err;
     *family = _tag_iscsi_family_();
     family->lid = lid;
-    snprintf(family->status, sizeof family->status, "%s", checkData(row.record) == 0 ? "Healthy" : "Unhealthy");
+    snprintf(family->status, sizeof family->status, "%s", isHealthy(row) ? "Healthy" : "Unhealthy");
     return 0;
 }

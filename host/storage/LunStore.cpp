@@ -3,27 +3,20 @@
 #include "host/core/LastError.h"
 #include "host/services/Retention.h"
 #include "host/state/Database.h"
+#include "host/state/Fields.h"
 #include "host/storage/MapFile.h"
+#include "host/storage/SnapshotStore.h"
 #include "host/storage/Volumes.h"
 #include "platform/error.h"
 
 #include <algorithm>
-#include <cstring>
 #include <sys/random.h>
 #include <sys/stat.h>
 
 namespace norvhost {
 namespace {
 
-#define LUN_COLUMNS "lid, uuid, name, type, location, size, extent_size, restored_time, options, loaded"
-
-template <size_t size>
-void copyText(char (&field)[size], std::string_view text)
-{
-    const size_t length = std::min(text.size(), size - 1);
-    memcpy(field, text.data(), length);
-    field[length] = '\0';
-}
+#define LUN_COLUMNS "lid, uuid, name, type, location, size, extent_size, restored_time, options, loaded, restoring_uuid"
 
 LunRow readRow(const Query &query)
 {
@@ -38,6 +31,7 @@ LunRow readRow(const Query &query)
     row.record.restored_time = query.integer(7);
     row.record.options = static_cast<uint32_t>(query.number(8));
     row.loaded = query.integer(9) != 0;
+    row.restoring_uuid = query.text(10);
     return row;
 }
 
@@ -91,9 +85,7 @@ int loadLunByLid(int lid, LunRow &row)
 
 int loadLunByUuid(std::string_view uuid, LunRow &row)
 {
-    std::string lower_case(uuid);
-    std::transform(lower_case.begin(), lower_case.end(), lower_case.begin(),
-                   [](char c) { return c >= 'A' && c <= 'Z' ? static_cast<char>(c + 'a' - 'A') : c; });
+    const std::string lower_case = lowerCase(uuid);
     Query query("SELECT " LUN_COLUMNS " FROM luns WHERE uuid = ?1");
     return readOnlyRow(query.bind(lower_case), "UUID", uuid, row);
 }
@@ -110,6 +102,15 @@ int forEachLun(const std::function<void(const LunRow &)> &visit)
     while (query.next())
         visit(readRow(query));
     return query.error();
+}
+
+int isInUse(const LunRow &row, bool &in_use)
+{
+    int mappings;
+    if (int err = countMappings(row.record.lid, mappings))
+        return err;
+    in_use = mappings > 0 && row.loaded;
+    return 0;
 }
 
 int countMappings(int lid, int &count)
@@ -131,9 +132,14 @@ int insertLun(const LunRow &row)
     if (int err = isBlock(lun.type) ? checkDeviceUnused(row) : loadVolume(lun.location, volume))
         return err;
 
-    Query query("INSERT INTO luns (" LUN_COLUMNS ") VALUES (?1, ?2, ?3, ?4, ?5, ?6, ?7, ?8, ?9, ?10)");
+    Query query("INSERT INTO luns (" LUN_COLUMNS ") VALUES (?1, ?2, ?3, ?4, ?5, ?6, ?7, ?8, ?9, ?10, ?11)");
     query.bind(lun.lid).bind(lun.uuid).bind(lun.name).bind(lun.type).bind(lun.location);
-    query.bind(lun.size).bind(lun.extent_size).bind(lun.restored_time).bind(lun.options).bind(row.loaded);
+    query.bind(lun.size)
+        .bind(lun.extent_size)
+        .bind(lun.restored_time)
+        .bind(lun.options)
+        .bind(row.loaded)
+        .bind(row.restoring_uuid);
     if (int err = query.run())
         return query.violates("luns.name") ? nameTaken(row) : err;
     return transaction.commit();
@@ -163,12 +169,38 @@ int removeLun(int lid)
         return transaction.error();
     if (int err = refuseMapped(lid))
         return err;
+    if (int err = removeSnapshotsOfLun(lid))
+        return err;
     if (int err = removeRetentionPolicy(lun_retention_kind, std::to_string(lid)))
         return err;
     Query query("DELETE FROM luns WHERE lid = ?1");
     if (int err = query.bind(lid).run())
         return err;
     return transaction.commit();
+}
+
+int markRestore(int lid, std::string_view snapshot_uuid)
+{
+    Query query("UPDATE luns SET restoring_uuid = ?2 WHERE lid = ?1");
+    return query.bind(lid).bind(snapshot_uuid).run();
+}
+
+int endRestore(int lid, int64_t time)
+{
+    Query query("UPDATE luns SET restoring_uuid = '', restored_time = ?2 WHERE lid = ?1");
+    return query.bind(lid).bind(time).run();
+}
+
+int loadInterruptedRestores(std::vector<LunRow> &rows)
+{
+    std::vector<LunRow> found;
+    Query query("SELECT " LUN_COLUMNS " FROM luns WHERE restoring_uuid <> '' ORDER BY lid");
+    while (query.next())
+        found.push_back(readRow(query));
+    if (query.error())
+        return query.error();
+    rows = std::move(found);
+    return 0;
 }
 
 std::string newUuid()

@@ -6,9 +6,21 @@ namespace norvhost {
 namespace {
 
 constexpr std::string_view prefix = "iSCSI_";
+constexpr std::string_view snapshot_prefix = "SNAPSHOT_L";
 
 /// Kinds with all of these bits number their files in five digits, the others in three.
 constexpr int five_digit_bits = 71;
+
+/// Takes a number within 1 to `most` and the "_" behind it off the front.
+bool takeNumber(std::string_view &text, int most, int &number)
+{
+    const char *end = text.data() + text.size();
+    const auto [rest, error] = std::from_chars(text.data(), end, number);
+    if (error != std::errc() || rest == end || *rest != '_' || number < 1 || number > most)
+        return false;
+    text.remove_prefix(static_cast<size_t>(rest + 1 - text.data()));
+    return true;
+}
 
 } // namespace
 
@@ -38,10 +50,42 @@ bool parseMapFileName(std::string_view file_name, int &lid)
         return false;
     if (file_name.find_last_not_of('0') != file_name.find_last_of('_'))
         return false;
-    const char *begin = file_name.data() + prefix.size();
-    const char *end = file_name.data() + file_name.size();
-    const auto [rest, error] = std::from_chars(begin, end, lid);
-    return error == std::errc() && rest != end && *rest == '_' && lid >= 1 && lid <= NORV_LUN_ID_MAX;
+    file_name.remove_prefix(prefix.size());
+    return takeNumber(file_name, NORV_LUN_ID_MAX, lid);
+}
+
+std::string snapshotFolderName(const _tag_iscsi_snapshot_ &snapshot)
+{
+    return std::string(snapshot_prefix) + std::to_string(snapshot.lid) + "_S" + std::to_string(snapshot.snap_id) + "_" +
+           snapshot.name;
+}
+
+std::string snapshotFolder(const _tag_iscsi_snapshot_ &snapshot)
+{
+    return std::string(snapshot.root_path) + "/" + (isInTrash(snapshot) ? trash_folder : snapshot_folder) + "/" +
+           snapshotFolderName(snapshot);
+}
+
+std::string snapshotDataPath(const _tag_iscsi_snapshot_ &snapshot)
+{
+    return snapshotDataPath(snapshotFolder(snapshot));
+}
+
+std::string snapshotDataPath(const std::string &folder)
+{
+    return folder + "/data";
+}
+
+bool parseSnapshotFolderName(std::string_view folder_name, int &lid)
+{
+    int snap_id;
+    if (folder_name.substr(0, snapshot_prefix.size()) != snapshot_prefix)
+        return false;
+    folder_name.remove_prefix(snapshot_prefix.size());
+    if (!takeNumber(folder_name, NORV_LUN_ID_MAX, lid) || folder_name.substr(0, 1) != "S")
+        return false;
+    folder_name.remove_prefix(1);
+    return takeNumber(folder_name, NORV_SNAPSHOT_ID_MAX, snap_id) && !folder_name.empty();
 }
 
 } // namespace norvhost

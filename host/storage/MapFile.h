@@ -1,15 +1,17 @@
-/// Where the data of a LUN lies: the one place that knows the names of files and folders.
+/// Where the data of LUNs and snapshots lies: the one place that knows the names of files and folders.
 #pragma once
 
 #include "platform/iscsi_lun.h"
+#include "platform/iscsi_snapshot.h"
 
 #include <string>
 #include <string_view>
 
 namespace norvhost {
 
-/// The folders of a volume that hold LUNs in use and LUNs in the trash.
+/// The folders of a volume that hold LUNs in use, snapshots in use, and LUNs and snapshots in the trash.
 constexpr const char *data_folder = "@iSCSITrg";
+constexpr const char *snapshot_folder = "@Snapshot";
 constexpr const char *trash_folder = "@EP_trash";
 
 /// What the readers of these names reserve for them, the NUL included.
@@ -29,9 +31,18 @@ inline bool isFullyAllocated(int type)
 {
     return type == NORV_LUN_TYPE_FILE;
 }
+/// Files that share blocks with others when they are cloned: not those allocated in full, whose space is promised.
+inline bool isSparse(int type)
+{
+    return (type & NORV_LUN_TYPE_THIN) == NORV_LUN_TYPE_THIN;
+}
 inline bool isInTrash(const _tag_iscsi_lun_ &lun)
 {
     return lun.options & NORV_LUN_OPTION_TRASH;
+}
+inline bool isInTrash(const _tag_iscsi_snapshot_ &snapshot)
+{
+    return snapshot.flags & NORV_SNAPSHOT_TRASH;
 }
 
 /// "iSCSI_<lid>_Extent_<name>_<zeros>" for extent-pool kinds, "iSCSI_<lid>_<name>_<zeros>" for others.
@@ -45,5 +56,18 @@ std::string dataPath(const _tag_iscsi_lun_ &lun);
 
 /// Whether this is a map file's name, and of which LUN ID.
 bool parseMapFileName(std::string_view file_name, int &lid);
+
+/// "SNAPSHOT_L<lid>_S<number>_<name>", a folder of its own for each snapshot.
+std::string snapshotFolderName(const _tag_iscsi_snapshot_ &snapshot);
+
+/// Its path, in the folder that the snapshot's trash flag says.
+std::string snapshotFolder(const _tag_iscsi_snapshot_ &snapshot);
+
+/// The file in it that holds the snapshot's data.
+std::string snapshotDataPath(const _tag_iscsi_snapshot_ &snapshot);
+std::string snapshotDataPath(const std::string &folder);
+
+/// Whether this is a snapshot folder's name, and of which LUN ID.
+bool parseSnapshotFolderName(std::string_view folder_name, int &lid);
 
 } // namespace norvhost

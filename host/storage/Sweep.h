@@ -1,9 +1,9 @@
 /// Putting right what a killed process left behind.
 ///
-/// Only map files in the data and trash folders of mounted volumes are looked at, each under its LUN's lock, so that
-/// no creation or move in progress is disturbed. A file goes only when it provably is ours and of no LUN: it bears
-/// this store's mark and no row has its LUN's UUID, or it is a second name of a LUN's file. Files without our mark
-/// (another store's, or this one's after its state was lost) are reported and stay.
+/// Only map files and snapshot folders in their folders of mounted volumes are looked at, each under its LUN's lock, so
+/// that no creation or move in progress is disturbed. One goes only when it provably is ours and nobody's: it bears
+/// this store's mark and no row has its UUID, it is a second name of a LUN's file, or it is a snapshot folder without
+/// any file. What lacks our mark (another store's, or this one's after its state was lost) is reported and stays.
 #pragma once
 
 #include <string>
@@ -18,10 +18,10 @@ struct SweepResult {
     std::vector<std::string> failed;  ///< reasons why something could not be done
 };
 
-/// Sweeps all mounted volumes.
+/// Sweeps all mounted volumes and completes interrupted restores.
 int sweepVolumes(SweepResult &result);
 
-/// Sweeps the files of one LUN ID, whose lock the caller holds.
+/// Sweeps what belongs to one LUN ID, whose lock the caller holds.
 int sweepLun(int lid);
 
 } // namespace norvhost

@@ -32,6 +32,13 @@ const char *countAttribute(Transfer transfer)
     return transfer == Transfer::sending ? "user.norv.sending" : "user.norv.copying";
 }
 
+int lookAt(int fd, const std::string &path, struct stat &status)
+{
+    if (fstat(fd, &status) != 0)
+        return failErrno(NORV_ERR_STAT_PATH, errno, "cannot look at %s", path.c_str());
+    return 0;
+}
+
 int openMapFile(const std::string &path, FileDescriptor &file, struct stat &status)
 {
     file.reset(open(path.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
@@ -40,27 +47,27 @@ int openMapFile(const std::string &path, FileDescriptor &file, struct stat &stat
     if (!file)
         return failErrno(errno == ENOENT || errno == ENOTDIR ? NORV_ERR_FILE_NOT_FOUND : NORV_ERR_OPEN_FILE, errno,
                          "cannot open %s", path.c_str());
-    if (fstat(file.get(), &status) != 0)
-        return failErrno(NORV_ERR_STAT_PATH, errno, "cannot look at %s", path.c_str());
+    if (int err = lookAt(file.get(), path, status))
+        return err;
     if (!S_ISREG(status.st_mode))
         return fail(NORV_ERR_BAD_MAP_FILE, "%s is no regular file", path.c_str());
     return 0;
 }
 
 /// Empty text for an attribute that is not there.
-int readAttribute(const FileDescriptor &file, const std::string &path, const char *name, std::string &text)
+int readAttribute(int fd, const std::string &path, const char *name, std::string &text)
 {
     char buffer[256];
-    const ssize_t length = fgetxattr(file.get(), name, buffer, sizeof buffer);
+    const ssize_t length = fgetxattr(fd, name, buffer, sizeof buffer);
     if (length < 0 && errno != ENODATA)
         return failErrno(NORV_ERR_READ_FILE, errno, "cannot read the attribute %s of %s", name, path.c_str());
     text.assign(buffer, length < 0 ? 0 : static_cast<size_t>(length));
     return 0;
 }
 
-int writeAttribute(const FileDescriptor &file, const std::string &path, const char *name, const std::string &text)
+int writeAttribute(int fd, const std::string &path, const char *name, const std::string &text)
 {
-    if (fsetxattr(file.get(), name, text.data(), text.size(), 0) != 0)
+    if (fsetxattr(fd, name, text.data(), text.size(), 0) != 0)
         return failErrno(NORV_ERR_WRITE_FILE, errno, "cannot write the attribute %s of %s", name, path.c_str());
     return 0;
 }
@@ -77,10 +84,10 @@ int64_t modifiedNs(const struct stat &status)
     return static_cast<int64_t>(status.st_mtim.tv_sec) * 1000000000 + status.st_mtim.tv_nsec;
 }
 
-int readStored(const FileDescriptor &file, const std::string &path, StoredVersions &stored)
+int readStored(int fd, const std::string &path, StoredVersions &stored)
 {
     std::string text;
-    if (int err = readAttribute(file, path, version_attribute, text))
+    if (int err = readAttribute(fd, path, version_attribute, text))
         return err;
     if (text.empty())
         return 0;
@@ -91,9 +98,9 @@ int readStored(const FileDescriptor &file, const std::string &path, StoredVersio
     return 0;
 }
 
-int writeStored(const FileDescriptor &file, const std::string &path, const StoredVersions &stored)
+int writeStored(int fd, const std::string &path, const StoredVersions &stored)
 {
-    return writeAttribute(file, path, version_attribute,
+    return writeAttribute(fd, path, version_attribute,
                           std::string(stored.base) + " " + stored.current + " " + std::to_string(stored.size) + " " +
                               std::to_string(stored.modified_ns));
 }
@@ -109,18 +116,11 @@ std::string localVersion(const struct stat &status)
     return text;
 }
 
-} // namespace
-
-int readVersions(const std::string &path, Versions &versions)
+int versionsOf(int fd, const std::string &path, const struct stat &status, Versions &versions)
 {
-    FileDescriptor file;
-    struct stat status;
     StoredVersions stored;
-    if (int err = openMapFile(path, file, status))
+    if (int err = readStored(fd, path, stored))
         return err;
-    if (int err = readStored(file, path, stored))
-        return err;
-
     versions.base = stored.base;
     versions.current = stored.current;
     const bool synchronised = stored.present && versions.base == versions.current;
@@ -130,6 +130,35 @@ int readVersions(const std::string &path, Versions &versions)
     return 0;
 }
 
+/// Stores that the file is what its base says.
+int storeSynchronised(int fd, const std::string &path, StoredVersions &stored)
+{
+    // The kernel's file times are as coarse as its clock tick: a write right after this must not get the time that we
+    // remember, so the file's time goes back by a second.
+    timespec times[2] = {{0, UTIME_OMIT}, {}};
+    clock_gettime(CLOCK_REALTIME, &times[1]);
+    times[1].tv_sec -= 1;
+    struct stat status;
+    if (futimens(fd, times) != 0 || fstat(fd, &status) != 0)
+        return failErrno(NORV_ERR_WRITE_FILE, errno, "cannot set the time of %s", path.c_str());
+
+    snprintf(stored.current, sizeof stored.current, "%s", stored.base);
+    stored.size = static_cast<uint64_t>(status.st_size);
+    stored.modified_ns = modifiedNs(status);
+    return writeStored(fd, path, stored);
+}
+
+} // namespace
+
+int readVersions(const std::string &path, Versions &versions)
+{
+    FileDescriptor file;
+    struct stat status;
+    if (int err = openMapFile(path, file, status))
+        return err;
+    return versionsOf(file.get(), path, status, versions);
+}
+
 int beginSynchronisation(const std::string &path, const std::string &incoming)
 {
     FileDescriptor file;
@@ -137,10 +166,10 @@ int beginSynchronisation(const std::string &path, const std::string &incoming)
     StoredVersions stored;
     if (int err = openMapFile(path, file, status))
         return err;
-    if (int err = readStored(file, path, stored))
+    if (int err = readStored(file.get(), path, stored))
         return err;
     snprintf(stored.current, sizeof stored.current, "%s", incoming.c_str());
-    if (int err = writeStored(file, path, stored))
+    if (int err = writeStored(file.get(), path, stored))
         return err;
     return flush(file, path);
 }
@@ -152,25 +181,44 @@ int finishSynchronisation(const std::string &path)
     StoredVersions stored;
     if (int err = openMapFile(path, file, status))
         return err;
-    if (int err = readStored(file, path, stored))
+    if (int err = readStored(file.get(), path, stored))
         return err;
     if (int err = flush(file, path))
         return err;
 
-    // The kernel's file times are as coarse as its clock tick: a write right after this must not get the time that we
-    // remember, so the file's time goes back by a second.
-    timespec times[2] = {{0, UTIME_OMIT}, {}};
-    clock_gettime(CLOCK_REALTIME, &times[1]);
-    times[1].tv_sec -= 1;
-    if (futimens(file.get(), times) != 0 || fstat(file.get(), &status) != 0)
-        return failErrno(NORV_ERR_WRITE_FILE, errno, "cannot set the time of %s", path.c_str());
-
     snprintf(stored.base, sizeof stored.base, "%s", stored.current);
-    stored.size = static_cast<uint64_t>(status.st_size);
-    stored.modified_ns = modifiedNs(status);
-    if (int err = writeStored(file, path, stored))
+    if (int err = storeSynchronised(file.get(), path, stored))
         return err;
     return flush(file, path);
+}
+
+int copyVersions(int from, int to, bool quiet)
+{
+    const std::string what = "a clone";
+    struct stat status;
+    Versions versions;
+    if (int err = lookAt(from, what, status))
+        return err;
+    if (int err = versionsOf(from, what, status, versions))
+        return err;
+
+    if (versions.current == NORV_ZERO_UUID) { // never synchronised
+        if (fremovexattr(to, version_attribute) != 0 && errno != ENODATA)
+            return failErrno(NORV_ERR_WRITE_FILE, errno, "cannot remove the attribute %s of %s", version_attribute,
+                             what.c_str());
+        return 0;
+    }
+    StoredVersions stored;
+    snprintf(stored.base, sizeof stored.base, "%s", versions.base.c_str());
+    if (isSynchronised(versions)) {
+        if (quiet)
+            return storeSynchronised(to, what, stored);
+        if (int err = lookAt(to, what, status))
+            return err;
+        versions.current = localVersion(status);
+    }
+    snprintf(stored.current, sizeof stored.current, "%s", versions.current.c_str());
+    return writeStored(to, what, stored);
 }
 
 int readTransferCount(const std::string &path, Transfer transfer, TransferCount &count)
@@ -180,7 +228,7 @@ int readTransferCount(const std::string &path, Transfer transfer, TransferCount 
     std::string text;
     if (int err = openMapFile(path, file, status))
         return err;
-    if (int err = readAttribute(file, path, countAttribute(transfer), text))
+    if (int err = readAttribute(file.get(), path, countAttribute(transfer), text))
         return err;
     TransferCount read;
     if (!text.empty() && sscanf(text.c_str(), "%" SCNu64 " %" SCNu64, &read.done, &read.total) != 2)
@@ -195,7 +243,7 @@ int writeTransferCount(const std::string &path, Transfer transfer, const Transfe
     struct stat status;
     if (int err = openMapFile(path, file, status))
         return err;
-    return writeAttribute(file, path, countAttribute(transfer),
+    return writeAttribute(file.get(), path, countAttribute(transfer),
                           std::to_string(count.done) + " " + std::to_string(count.total));
 }
 

@@ -1,6 +1,8 @@
 /// Versions of a map file, kept in extended attributes of the file so that they travel with it.
 #pragma once
 
+#include "platform/extent_pool.h"
+
 #include <cstdint>
 #include <string>
 
@@ -36,6 +38,16 @@ int beginSynchronisation(const std::string &path, const std::string &incoming);
 
 /// Flushes the file; then the state that arrived is its base.
 int finishSynchronisation(const std::string &path);
+
+/// Gives `to`, which holds a copy of `from`'s data, the versions of `from`. Without `quiet` somebody may be writing to
+/// `to`: its current version differs from the base then. The caller flushes `to`.
+int copyVersions(int from, int to, bool quiet);
+
+/// Whether the file holds exactly the state that a synchronisation brought.
+inline bool isSynchronised(const Versions &versions)
+{
+    return versions.base == versions.current && versions.base != NORV_ZERO_UUID;
+}
 
 /// Zeros when nothing was ever transferred.
 int readTransferCount(const std::string &path, Transfer transfer, TransferCount &count);

@@ -1,0 +1,30 @@
+/// Texts of rows in the platform's records.
+#pragma once
+
+#include <algorithm>
+#include <cstring>
+#include <string>
+#include <string_view>
+
+namespace norvhost {
+
+/// Copies what fits of the text into a field of fixed width, and ends it with NUL.
+template <size_t size>
+void copyText(char (&field)[size], std::string_view text)
+{
+    const size_t length = std::min(text.size(), size - 1);
+    memcpy(field, text.data(), length);
+    field[length] = '\0';
+}
+
+/// With ASCII letters in lower case, as the state has UUIDs.
+inline std::string lowerCase(std::string_view text)
+{
+    std::string result(text);
+    for (char &c : result)
+        if (c >= 'A' && c <= 'Z')
+            c = static_cast<char>(c + 'a' - 'A');
+    return result;
+}
+
+} // namespace norvhost
