@@ -213,6 +213,14 @@ int removeRetentionPolicy(int lid)
     return norvhost::removeRetentionPolicy(lun_retention_kind, std::to_string(lid));
 }
 
+int tryRetention(int lid, const RetentionPolicy *policy, std::vector<RetentionVerdict> &verdicts)
+{
+    LunRow lun;
+    if (int err = loadLunByLid(lid, lun))
+        return err;
+    return norvhost::tryRetention(lid, policy, verdicts);
+}
+
 int listEvents(int64_t since, int64_t count, std::vector<Event> &events)
 {
     return norvhost::listEvents(since, count, events);
