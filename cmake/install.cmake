@@ -26,6 +26,8 @@ if(TARGET norvhost)
     install_programs(${CMAKE_INSTALL_BINDIR} iscsictl)
     install_programs(${CMAKE_INSTALL_SBINDIR} iscsi-host iscsi-portald)
     install_programs(norv/sbin epck) # below the prefix /usr this is where the library looks for it
+    install(FILES host/systemd/iscsi-host-schedule.service host/systemd/iscsi-host-schedule.timer
+        DESTINATION lib/systemd/system)
 endif()
 
 target_include_directories(iscsiwebapi INTERFACE

@@ -191,6 +191,22 @@ int showStatus(bool as_json)
     return exit_ok;
 }
 
+int runDue()
+{
+    std::vector<iscsihost::ScheduleRun> runs;
+    const int err = iscsihost::runDueSchedules(runs);
+    for (const iscsihost::ScheduleRun &run : runs) {
+        if (run.code)
+            fprintf(stderr, "iscsi-host: snapshot of LUN %d (%s) failed: error %d: %s\n", run.schedule.lid,
+                    run.schedule.lun_name.c_str(), run.code, run.reason.c_str());
+        else
+            printf("snapshot of LUN %d (%s) taken\n", run.schedule.lid, run.schedule.lun_name.c_str());
+    }
+    if (err && runs.empty())
+        return failed("schedule run-due", err);
+    return err ? exit_failed : exit_ok;
+}
+
 } // namespace
 
 int main(int argc, char **argv)
@@ -241,6 +257,12 @@ int main(int argc, char **argv)
     set->add_option("ADDR", address, "IPv4 or IPv6 address, or 'all'; takes effect when the service starts")
         ->required();
     set->callback([&] { status = setPortal(address); });
+
+    CLI::App *schedule = app.add_subcommand("schedule", "Jobs of LUNs; 'iscsictl schedule' shows and changes them");
+    schedule->require_subcommand(1);
+    schedule->add_subcommand("run-due", "Run what is due; the system's timer calls this each minute")->callback([&] {
+        status = runDue();
+    });
 
     try {
         app.parse(argc, argv);
