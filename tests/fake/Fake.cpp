@@ -4,6 +4,7 @@
 #include "tests/fake/SharedList.h"
 
 #include <algorithm>
+#include <cstdio>
 
 namespace fake {
 namespace {
@@ -119,6 +120,11 @@ bool isName(const std::string &text, size_t longest)
     const auto is_bad = [](unsigned char c) { return c < ' ' || c == 0x7F || c == '/'; };
     return !text.empty() && text != "." && text != ".." && text.size() <= longest &&
            std::none_of(text.begin(), text.end(), is_bad);
+}
+
+void makeUUID(char (&uuid)[37])
+{
+    snprintf(uuid, sizeof(uuid), "00000000-0000-4000-8000-%012x", ++model().uuids_made);
 }
 
 } // namespace fake

@@ -5,6 +5,7 @@
 #include "platform/extent_pool.h"
 #include "platform/iscsi_config.h"
 #include "platform/iscsi_lun.h"
+#include "platform/iscsi_snapshot.h"
 #include "platform/iscsi_target.h"
 
 #include <cstdint>
@@ -34,6 +35,13 @@ struct LUN {
     MapFile map_file;
 };
 
+struct Snapshot {
+    _tag_iscsi_snapshot_ record{};
+    bool is_loaded = false;
+    bool is_locked = false; ///< by an action
+    std::set<std::string> app_keys;
+};
+
 struct Target {
     _tag_iscsi_target_ record{};
     std::vector<std::pair<std::string, int>> masking; ///< IQN and permission, in listing order
@@ -49,10 +57,14 @@ struct Job {
 struct Model {
     std::set<std::string> volumes = {"/volume1"};
     std::map<int, LUN> luns;
+    std::map<std::pair<int, int>, Snapshot> snapshots;        ///< by LUN ID and number
+    std::map<std::string, _tag_iscsi_export_config_> exports; ///< by directory
+    int held_by = -1; ///< a descriptor to be read before any wait for a lock ends; -1 for none
     std::map<int, Target> targets;
     std::vector<_tag_iscsi_mapping_> mappings; ///< links unused; any target ID
     std::map<long, Job> jobs;
     std::set<std::pair<std::string, std::string>> retention_policies; ///< kind and key
+    size_t retention_keeps = 1;                                       ///< newest things that every policy keeps
     int exit_status = 0;                                              ///< of every program run
     unsigned int uuids_made = 0;
 };
@@ -83,10 +95,17 @@ void failCall(uint32_t n, long value);
 void failCall(const std::string &name, uint32_t n, long value);
 
 /// Makes the next calls of a function answer these values instead of the model's: the lock flag, the
-/// progress state, a count, an exit status, or a job's ID. After the last value the model speaks again.
+/// progress state, a count, an exit status, a job's ID, or the outcome of a check. After the last value the model
+/// speaks again.
 void answer(const std::string &name, const std::vector<long> &values);
 
-/// Answers of NORViSCSIConfGet and NORViSCSIConfTargetLoad that were not freed yet.
+/// Waits until no detached child is left, children of children included. Returns their exit statuses,
+/// 128 + n for one that signal n ended.
+std::vector<int> waitForChildren();
+
+/// Answers of NORViSCSIConfGet and NORViSCSIConfTargetLoad, snapshot records of listings, and lists of
+/// texts that were not freed yet; the records are counted down in programs with fake_process.
 int unfreedAnswers();
+void noteFreed(const void *memory);
 
 } // namespace fake

@@ -1,8 +1,12 @@
-// Scheduled jobs, retention policies and programs on the fake's model.
-#include "platform/core.h"
+// Scheduled jobs and retention policies on the fake's model.
+#include "platform/error.h"
 #include "platform/retention.h"
 #include "platform/schedule.h"
 #include "tests/fake/Script.h"
+
+#include <algorithm>
+#include <cstdlib>
+#include <vector>
 
 using namespace fake;
 
@@ -51,15 +55,63 @@ int NORVRETENTIONRemovePolicy(const char *kind, const char *key)
     return 0;
 }
 
-int NLIBCExec(const char *program, const char *arg1, const char *arg2, const char *arg3, const char *arg4)
+int NORVRETENTIONRunPolicy(const char *kind, const char *key, NORV_RETENTION_TARGET_GET get,
+                           NORV_RETENTION_TARGET_DELETE remove, int flags)
 {
-    std::string arguments = program;
-    for (const char *argument : {arg1, arg2, arg3, arg4}) {
-        if (!argument)
-            break;
-        arguments += std::string(", ") + argument;
-    }
-    if (auto failure = called(__func__, arguments))
+    const bool has_hooks =
+        get == NORVRETAINERiSCSIRetentionTargetGet && remove == NORVRETAINERiSCSIRetentionTargetDelete;
+    if (auto failure = called(__func__, kind, key, has_hooks ? "snapshot hooks" : "other hooks", flags))
         return *failure;
-    return static_cast<int>(answerOf(__func__, model().exit_status));
+    if (model().retention_policies.count({kind, key}) == 0)
+        return 0;
+    std::vector<_tag_retention_target_> targets;
+    _tag_retention_target_ *list = nullptr;
+    const int err = get(key, &list);
+    while (_tag_retention_target_ *target = list) {
+        targets.push_back(*target);
+        list = target->next;
+        free(target);
+    }
+    if (err)
+        return -1;
+    std::sort(targets.begin(), targets.end(), [](const auto &a, const auto &b) { return a.time > b.time; });
+    for (size_t i = model().retention_keeps; i < targets.size(); ++i) {
+        if (!targets[i].protected_ && remove(key, &targets[i]))
+            return -1;
+    }
+    return 0;
+}
+
+int NORVRETAINERiSCSIRetentionTargetGet(const char *key, _tag_retention_target_ **targets)
+{
+    if (auto failure = called(__func__, key))
+        return *failure;
+    *targets = nullptr;
+    for (const auto &[place, snapshot] : model().snapshots) {
+        if (std::to_string(place.first) != key)
+            continue;
+        auto *target = static_cast<_tag_retention_target_ *>(calloc(1, sizeof(_tag_retention_target_)));
+        if (!target)
+            return NORV_ERR_OUT_OF_MEMORY;
+        put(target->uuid, textOf(snapshot.record.uuid));
+        target->time = snapshot.record.snap_time;
+        target->protected_ = snapshot.record.user_locked || snapshot.is_locked || !snapshot.app_keys.empty();
+        target->next = *targets;
+        *targets = target;
+    }
+    return 0;
+}
+
+int NORVRETAINERiSCSIRetentionTargetDelete(const char *key, const _tag_retention_target_ *target)
+{
+    if (auto failure = called(__func__, key, target->uuid))
+        return *failure;
+    auto &snapshots = model().snapshots;
+    const auto found = std::find_if(snapshots.begin(), snapshots.end(), [&](const auto &entry) {
+        return textOf(entry.second.record.uuid) == target->uuid;
+    });
+    if (found == snapshots.end())
+        return NORV_ERR_NO_SUCH_SNAPSHOT;
+    snapshots.erase(found);
+    return 0;
 }

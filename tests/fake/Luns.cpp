@@ -37,16 +37,9 @@ LUN *byID(int lid)
     return found == model().luns.end() ? nullptr : &found->second;
 }
 
-/// Callers zero the record first: what an appliance leaves out of it must not be an earlier LUN's.
 int copyOut(const LUN *lun, _tag_iscsi_lun_ *out)
 {
-    static const _tag_iscsi_lun_ zero{};
-    if (memcmp(out, &zero, sizeof(zero)) != 0)
-        return NORV_ERR_BAD_PARAMETER;
-    if (!lun)
-        return NORV_ERR_NO_SUCH_LUN;
-    *out = lun->record;
-    return 0;
+    return copyRecord(lun ? &lun->record : nullptr, out, NORV_ERR_NO_SUCH_LUN);
 }
 
 bool isMapped(int lid)
@@ -142,6 +135,26 @@ int setLoaded(const _tag_iscsi_lun_ *record, bool is_loaded)
 
 } // namespace
 
+LUN *fake::findLUN(const char *uuid)
+{
+    return byUUID(uuid);
+}
+
+int fake::createLUN(_tag_iscsi_lun_ &lun)
+{
+    if (int err = judge(lun))
+        return err;
+    const int lid = freeID();
+    if (lid > NORV_LUN_ID_MAX)
+        return NORV_ERR_MAX_LUNS;
+    lun.lid = lid;
+    lun.options = 0;
+    lun.restored_time = 0;
+    makeUUID(lun.uuid);
+    model().luns[lid].record = lun;
+    return 0;
+}
+
 int NORViSCSILunConfigGetByUUID(const char *uuid, _tag_iscsi_lun_ *lun, int flags)
 {
     if (auto failure = called(__func__, uuid, flags))
@@ -191,17 +204,7 @@ int NORViSCSILunCreate(_tag_iscsi_lun_ *lun)
 {
     if (auto failure = called(__func__, lun->name, lun->type, lun->location, lun->size, lun->extent_size))
         return *failure;
-    if (int err = judge(*lun))
-        return err;
-    const int lid = freeID();
-    if (lid > NORV_LUN_ID_MAX)
-        return NORV_ERR_MAX_LUNS;
-    lun->lid = lid;
-    lun->options = 0;
-    lun->restored_time = 0;
-    snprintf(lun->uuid, sizeof(lun->uuid), "00000000-0000-4000-8000-%012x", ++model().uuids_made);
-    model().luns[lid].record = *lun;
-    return 0;
+    return createLUN(*lun);
 }
 
 int NORViSCSILunDelete(_tag_iscsi_lun_ *lun)

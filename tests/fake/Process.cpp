@@ -1,5 +1,6 @@
 #include "tests/fake/Process.h"
 
+#include "tests/fake/Fake.h"
 #include "tests/fake/SharedList.h"
 
 #include <sys/mman.h>
@@ -106,6 +107,15 @@ unsigned int sleep(unsigned int seconds)
 {
     fake::slept() += seconds;
     return 0;
+}
+
+// The linker sends calls of free() here, which --wrap asks it to.
+void __real_free(void *memory);
+
+void __wrap_free(void *memory)
+{
+    fake::noteFreed(memory);
+    __real_free(memory);
 }
 
 #pragma GCC visibility pop

@@ -1,6 +1,8 @@
 /// How the fake's functions take part in the journal and the script.
 #pragma once
 
+#include "platform/core.h"
+#include "platform/error.h"
 #include "tests/fake/Fake.h"
 
 #include <algorithm>
@@ -59,5 +61,32 @@ std::string textOf(const char (&field)[size])
 
 /// Whether a text can name an object: 1 to `longest` bytes, none of them a control character or "/".
 bool isName(const std::string &text, size_t longest);
+
+/// Answers with a record, or `missing` for null. Callers zero theirs first: what an appliance leaves
+/// out of it must not be an earlier object's.
+template <class Record>
+int copyRecord(const Record *record, Record *out, int missing)
+{
+    static const Record zero{};
+    if (memcmp(out, &zero, sizeof(zero)) != 0)
+        return NORV_ERR_BAD_PARAMETER;
+    if (!record)
+        return missing;
+    *out = *record;
+    return 0;
+}
+
+/// A UUID that no other object has.
+void makeUUID(char (&uuid)[37]);
+
+LUN *findLUN(const char *uuid);
+/// What NORViSCSILunCreate does, with its codes.
+int createLUN(_tag_iscsi_lun_ &lun);
+
+/// What NLIBCSzListPush does.
+int pushText(NLIBC_SZ_LIST &list, const std::string &text);
+
+int unfreedSnapshots();
+int unfreedLists();
 
 } // namespace fake

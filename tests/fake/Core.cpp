@@ -1,0 +1,163 @@
+// Programs, children, lists of texts, key-value files, and the event log. Children and files are real.
+#include "platform/core.h"
+#include "platform/error.h"
+#include "platform/event_log.h"
+#include "tests/fake/Script.h"
+
+#include <strings.h>
+#include <sys/prctl.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cstdio>
+#include <cstdlib>
+#include <fstream>
+
+using namespace fake;
+
+namespace {
+
+int unfreed_lists = 0;
+
+std::string trimmed(const std::string &text, const char *what)
+{
+    const size_t start = text.find_first_not_of(what);
+    return start == std::string::npos ? "" : text.substr(start, text.find_last_not_of(what) + 1 - start);
+}
+
+int readKeyValue(const char *path, const char *key, std::string &value)
+{
+    std::ifstream file(path);
+    if (!file)
+        return -1;
+    for (std::string line; std::getline(file, line);) {
+        const size_t equals = line.find('=');
+        if (equals == std::string::npos || trimmed(line.substr(0, equals), " \t") != key)
+            continue;
+        value = trimmed(trimmed(line.substr(equals + 1), " \t"), "\"");
+        return 1;
+    }
+    return 0;
+}
+
+const char *shown(const char *text)
+{
+    return text ? text : "(null)";
+}
+
+} // namespace
+
+int fake::unfreedLists()
+{
+    return unfreed_lists;
+}
+
+int fake::pushText(NLIBC_SZ_LIST &list, const std::string &text)
+{
+    if (list.count == list.capacity)
+        return -1;
+    list.texts[list.count] = strdup(text.c_str());
+    return list.texts[list.count] ? ++list.count : -1;
+}
+
+std::vector<int> fake::waitForChildren()
+{
+    std::vector<int> statuses;
+    int status = 0;
+    while (waitpid(-1, &status, 0) > 0)
+        statuses.push_back(WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status));
+    return statuses;
+}
+
+int NLIBCExec(const char *program, const char *arg1, const char *arg2, const char *arg3, const char *arg4)
+{
+    std::string arguments = program;
+    for (const char *argument : {arg1, arg2, arg3, arg4}) {
+        if (!argument)
+            break;
+        arguments += std::string(", ") + argument;
+    }
+    if (auto failure = called(__func__, arguments))
+        return *failure;
+    return static_cast<int>(answerOf(__func__, model().exit_status));
+}
+
+int NLIBCProcForkChildNoWait()
+{
+    if (auto failure = called(__func__))
+        return *failure;
+    prctl(PR_SET_CHILD_SUBREAPER, 1); // children of children become ours to wait for
+    return fork();
+}
+
+NLIBC_SZ_LIST *NLIBCSzListAlloc(int capacity)
+{
+    if (called(__func__, capacity))
+        return nullptr;
+    ++unfreed_lists;
+    return new NLIBC_SZ_LIST{0, capacity, new char *[static_cast<size_t>(capacity)]};
+}
+
+void NLIBCSzListFree(NLIBC_SZ_LIST *list)
+{
+    if (!list)
+        return;
+    for (int i = 0; i < list->count; ++i)
+        free(list->texts[i]);
+    delete[] list->texts;
+    delete list;
+    --unfreed_lists;
+}
+
+int NLIBCSzListPush(NLIBC_SZ_LIST *list, const char *text)
+{
+    if (auto failure = called(__func__, text))
+        return *failure;
+    return pushText(*list, text);
+}
+
+const char *NLIBCSzListGet(const NLIBC_SZ_LIST *list, int index)
+{
+    if (called(__func__, index))
+        return nullptr;
+    return index >= 0 && index < list->count ? list->texts[index] : nullptr;
+}
+
+int NLIBCFileExist(const char *path)
+{
+    if (auto failure = called(__func__, path))
+        return *failure;
+    return access(path, F_OK) == 0 ? 1 : 0;
+}
+
+int NLIBCFileGetKeyValue(const char *path, const char *key, char *value, int size)
+{
+    if (auto failure = called(__func__, path, key, size))
+        return *failure;
+    std::string text;
+    const int found = readKeyValue(path, key, text);
+    if (found == 1 && text.size() >= static_cast<size_t>(size))
+        return -1;
+    if (found == 1)
+        memcpy(value, text.c_str(), text.size() + 1);
+    return found;
+}
+
+int NLIBCFileCheckKeyValue(const char *path, const char *key, const char *value, int case_sensitive)
+{
+    if (auto failure = called(__func__, path, key, value, case_sensitive))
+        return *failure;
+    std::string text;
+    const int found = readKeyValue(path, key, text);
+    const auto compare = case_sensitive ? strcmp : strcasecmp;
+    return static_cast<int>(answerOf(__func__, found == 1 ? compare(text.c_str(), value) == 0 : found));
+}
+
+int NORVLogSet1(int scope, int level, unsigned int number, const char *text1, const char *text2, const char *text3,
+                const char *text4)
+{
+    char number_text[16];
+    snprintf(number_text, sizeof(number_text), "0x%08x", number);
+    return called(__func__, scope, level, number_text, shown(text1), shown(text2), shown(text3), shown(text4))
+        .value_or(0);
+}

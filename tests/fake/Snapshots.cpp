@@ -1,0 +1,356 @@
+// Snapshots, and the actions that start from them, on the fake's model. Every action is over when its
+// call returns; a test that wants one to run sets the locks itself.
+#include "platform/error.h"
+#include "platform/iscsi_snapshot.h"
+#include "tests/fake/Script.h"
+
+#include <poll.h>
+
+#include <cstdio>
+#include <cstdlib>
+#include <unordered_set>
+
+using namespace fake;
+
+namespace {
+
+template <class Test>
+Snapshot *find(Test test)
+{
+    for (auto &[key, snapshot] : model().snapshots) {
+        if (test(snapshot.record))
+            return &snapshot;
+    }
+    return nullptr;
+}
+
+Snapshot *byUUID(const char *uuid)
+{
+    return find([&](const auto &record) { return strcmp(record.uuid, uuid) == 0; });
+}
+
+Snapshot *byName(int lid, const char *name)
+{
+    return find([&](const auto &record) { return record.lid == lid && strcmp(record.name, name) == 0; });
+}
+
+int copyOut(const Snapshot *snapshot, _tag_iscsi_snapshot_ *out)
+{
+    return copyRecord(snapshot ? &snapshot->record : nullptr, out, NORV_ERR_NO_SUCH_SNAPSHOT);
+}
+
+bool isAsked(const _tag_iscsi_snapshot_query_ &query, const _tag_iscsi_snapshot_ &record)
+{
+    return (!(query.query_flags & NORV_SNAPSHOT_QUERY_LID) || record.lid == query.query_lid) &&
+           (!(query.query_flags & NORV_SNAPSHOT_QUERY_TIME) || record.snap_time >= query.query_time);
+}
+
+std::unordered_set<const void *> &listedRecords()
+{
+    static auto *records = new std::unordered_set<const void *>; // outlives whoever frees late
+    return *records;
+}
+
+int freeNumber(int lid)
+{
+    int number = 1;
+    while (model().snapshots.count({lid, number}) != 0)
+        ++number;
+    return number;
+}
+
+int setLoaded(const _tag_iscsi_snapshot_ *record, bool is_loaded)
+{
+    Snapshot *snapshot = byUUID(record->uuid);
+    if (!snapshot)
+        return NORV_ERR_NO_SUCH_SNAPSHOT;
+    const uint32_t trash = record->flags & NORV_SNAPSHOT_TRASH;
+    snapshot->record.flags = is_loaded ? snapshot->record.flags & ~trash : snapshot->record.flags | trash;
+    snapshot->is_loaded = is_loaded;
+    if (!is_loaded)
+        snapshot->is_locked = false;
+    return 0;
+}
+
+int waitFor(bool is_locked)
+{
+    constexpr int PATIENCE = 10000;
+    pollfd held{model().held_by, POLLIN, 0}; // poll() passes over a descriptor of -1
+    if (model().held_by >= 0 && poll(&held, 1, PATIENCE) != 1)
+        return NORV_ERR_TIMEOUT;
+    return is_locked ? NORV_ERR_TIMEOUT : 0;
+}
+
+} // namespace
+
+int fake::unfreedSnapshots()
+{
+    return static_cast<int>(listedRecords().size());
+}
+
+void fake::noteFreed(const void *memory)
+{
+    listedRecords().erase(memory);
+}
+
+int NORViSCSISnapshotConfGetByUUID(const char *uuid, _tag_iscsi_snapshot_ *snapshot)
+{
+    if (auto failure = called(__func__, uuid))
+        return *failure;
+    return copyOut(byUUID(uuid), snapshot);
+}
+
+int NORViSCSISnapshotConfGetByLIDAndName(int lid, const char *name, _tag_iscsi_snapshot_ *snapshot)
+{
+    if (auto failure = called(__func__, lid, name))
+        return *failure;
+    return copyOut(byName(lid, name), snapshot);
+}
+
+int NORViSCSISnapshotConfLoad(const _tag_iscsi_snapshot_query_ *query, _tag_iscsi_snapshot_list_ *list)
+{
+    const auto failure = called(__func__, query->query_flags, query->query_lid, query->query_time);
+    for (const auto &[key, snapshot] : model().snapshots) {
+        if (!isAsked(*query, snapshot.record))
+            continue;
+        auto *record = static_cast<_tag_iscsi_snapshot_ *>(malloc(sizeof(_tag_iscsi_snapshot_)));
+        if (!record)
+            return NORV_ERR_OUT_OF_MEMORY;
+        listedRecords().insert(record);
+        *record = snapshot.record;
+        record->previous = list->last;
+        record->next = nullptr;
+        (list->last ? list->last->next : list->first) = record;
+        list->last = record;
+        ++list->count;
+        if (failure)
+            break; // part of an answer is the caller's to free too
+    }
+    return failure.value_or(0);
+}
+
+int NORViSCSIIsSnapshotLocked(const _tag_iscsi_snapshot_ *snapshot, bool *locked)
+{
+    if (auto failure = called(__func__, snapshot->uuid))
+        return *failure;
+    const Snapshot *known = byUUID(snapshot->uuid);
+    if (!known)
+        return NORV_ERR_NO_SUCH_SNAPSHOT;
+    *locked = answerOf(__func__, known->is_locked) != 0;
+    return 0;
+}
+
+int NORViSCSISnapshotLockedAppKeysGet(const _tag_iscsi_snapshot_ *snapshot, NLIBC_SZ_LIST *keys)
+{
+    if (auto failure = called(__func__, snapshot->uuid))
+        return *failure;
+    const Snapshot *known = byUUID(snapshot->uuid);
+    if (!known)
+        return NORV_ERR_NO_SUCH_SNAPSHOT;
+    for (const auto &key : known->app_keys) {
+        if (pushText(*keys, key) < 0)
+            return NORV_ERR_OUT_OF_MEMORY;
+    }
+    return 0;
+}
+
+int NORViSCSISnapshotLockByAppKey(const _tag_iscsi_snapshot_ *snapshot, const char *key)
+{
+    if (auto failure = called(__func__, snapshot->uuid, key))
+        return *failure;
+    Snapshot *known = byUUID(snapshot->uuid);
+    if (!known)
+        return NORV_ERR_NO_SUCH_SNAPSHOT;
+    if (*key == '\0')
+        return NORV_ERR_APP_KEY;
+    known->app_keys.insert(key);
+    return 0;
+}
+
+int NORViSCSISnapshotUnlockByAppKey(const _tag_iscsi_snapshot_ *snapshot, const char *key)
+{
+    if (auto failure = called(__func__, snapshot->uuid, key))
+        return *failure;
+    Snapshot *known = byUUID(snapshot->uuid);
+    if (!known)
+        return NORV_ERR_NO_SUCH_SNAPSHOT;
+    return known->app_keys.erase(key) == 1 ? 0 : NORV_ERR_APP_KEY;
+}
+
+int NORViSCSIUnusedSnapshotNameFind(int lid, char *name, int size)
+{
+    if (auto failure = called(__func__, lid, size))
+        return *failure;
+    int number = 1;
+    do
+        snprintf(name, static_cast<size_t>(size), "auto-%d", number++);
+    while (byName(lid, name));
+    return 0;
+}
+
+int NORViSCSISnapshotCreate(const _tag_iscsi_lun_ *lun, _tag_iscsi_snapshot_ *snapshot)
+{
+    if (auto failure =
+            called(__func__, lun->uuid, snapshot->name, snapshot->desc, snapshot->taken_by, snapshot->snap_time,
+                   snapshot->flags, int(snapshot->app_consistent), int(snapshot->user_locked)))
+        return *failure;
+    const LUN *known = findLUN(lun->uuid);
+    if (!known)
+        return NORV_ERR_NO_SUCH_LUN;
+    const int lid = known->record.lid;
+    if (!isName(snapshot->name, sizeof(snapshot->name) - 1) || byName(lid, snapshot->name))
+        return NORV_ERR_SNAPSHOT_NAME;
+    const int number = freeNumber(lid);
+    if (number > NORV_SNAPSHOT_ID_MAX)
+        return NORV_ERR_MAX_SNAPSHOTS;
+    if (known->is_locked)
+        return NORV_ERR_LUN_LOCKED;
+    snapshot->snap_id = number;
+    makeUUID(snapshot->uuid);
+    makeUUID(snapshot->version);
+    Snapshot &taken = model().snapshots[{lid, number}];
+    taken.record = *snapshot;
+    taken.record.lid = lid;
+    taken.record.total_size = known->record.size;
+    put(taken.record.status, "Healthy");
+    put(taken.record.root_path, textOf(known->record.location));
+    return 0;
+}
+
+int NORViSCSISnapshotDelete(const _tag_iscsi_snapshot_ *snapshot, const char *who)
+{
+    if (auto failure = called(__func__, snapshot->uuid, who))
+        return *failure;
+    const Snapshot *known = byUUID(snapshot->uuid);
+    if (!known)
+        return NORV_ERR_NO_SUCH_SNAPSHOT;
+    if (known->record.user_locked)
+        return NORV_ERR_SNAPSHOT_USER_LOCKED;
+    if (known->is_locked || !known->app_keys.empty())
+        return NORV_ERR_SNAPSHOT_LOCKED;
+    model().snapshots.erase({known->record.lid, known->record.snap_id});
+    return 0;
+}
+
+int NORViSCSISnapshotRestore(const _tag_iscsi_snapshot_ *snapshot, const _tag_iscsi_lun_ *lun)
+{
+    if (auto failure = called(__func__, snapshot->uuid, lun->uuid))
+        return *failure;
+    const Snapshot *known = byUUID(snapshot->uuid);
+    const LUN *restored = findLUN(lun->uuid);
+    if (!known || !restored || known->record.lid != restored->record.lid)
+        return NORV_ERR_NO_SUCH_SNAPSHOT;
+    return restored->is_locked ? NORV_ERR_LUN_LOCKED : 0;
+}
+
+int NORViSCSISnapshotLoad(const _tag_iscsi_snapshot_ *snapshot)
+{
+    if (auto failure = called(__func__, snapshot->uuid, snapshot->flags))
+        return *failure;
+    return setLoaded(snapshot, true);
+}
+
+int NORViSCSISnapshotUnload(const _tag_iscsi_snapshot_ *snapshot)
+{
+    if (auto failure = called(__func__, snapshot->uuid, snapshot->flags))
+        return *failure;
+    return setLoaded(snapshot, false);
+}
+
+int NORViSCSISnapshotClone(const _tag_iscsi_snapshot_ *snapshot, _tag_iscsi_lun_ *clone)
+{
+    if (auto failure = called(__func__, snapshot->uuid, clone->name, clone->type, clone->location, clone->extent_size))
+        return *failure;
+    const Snapshot *known = byUUID(snapshot->uuid);
+    if (!known)
+        return NORV_ERR_NO_SUCH_SNAPSHOT;
+    clone->size = known->record.total_size;
+    return createLUN(*clone);
+}
+
+int NORViSCSILunClone(const _tag_iscsi_lun_ *source, _tag_iscsi_lun_ *clone)
+{
+    if (auto failure = called(__func__, source->uuid, clone->name, clone->type, clone->location, clone->extent_size))
+        return *failure;
+    return findLUN(source->uuid) ? createLUN(*clone) : NORV_ERR_NO_SUCH_LUN;
+}
+
+int NORViSCSILunWaitUntilUnlock(const _tag_iscsi_lun_ *lun, int limit)
+{
+    if (auto failure = called(__func__, lun->uuid, limit))
+        return *failure;
+    const LUN *known = findLUN(lun->uuid);
+    return known ? waitFor(known->is_locked) : NORV_ERR_NO_SUCH_LUN;
+}
+
+int NORViSCSISnapshotWaitUntilUnlock(const _tag_iscsi_snapshot_ *snapshot, int limit)
+{
+    if (auto failure = called(__func__, snapshot->uuid, limit))
+        return *failure;
+    const Snapshot *known = byUUID(snapshot->uuid);
+    return known ? waitFor(known->is_locked) : NORV_ERR_NO_SUCH_SNAPSHOT;
+}
+
+int NORViSCSISnapshotExport(const _tag_iscsi_snapshot_ *snapshot, const char *destination)
+{
+    if (auto failure = called(__func__, snapshot->uuid, destination))
+        return *failure;
+    const Snapshot *known = byUUID(snapshot->uuid);
+    if (!known)
+        return NORV_ERR_NO_SUCH_SNAPSHOT;
+    if (model().exports.count(destination) != 0)
+        return NORV_ERR_FILE_EXISTS;
+    _tag_iscsi_export_config_ &config = model().exports[destination];
+    put(config.desc, textOf(known->record.desc));
+    put(config.taken_by, textOf(known->record.taken_by));
+    config.snap_time = known->record.snap_time;
+    config.app_consistent = known->record.app_consistent;
+    config.user_locked = known->record.user_locked;
+    return 0;
+}
+
+int NORViSCSISnapshotExportCancel(const _tag_iscsi_snapshot_ *snapshot)
+{
+    if (auto failure = called(__func__, snapshot->uuid))
+        return *failure;
+    Snapshot *known = byUUID(snapshot->uuid);
+    if (!known)
+        return NORV_ERR_NO_SUCH_SNAPSHOT;
+    if (!known->is_locked)
+        return NORV_ERR_FILE_NOT_FOUND;
+    known->is_locked = false;
+    return 0;
+}
+
+int NORViSCSILunImport(const _tag_iscsi_lun_ *lun, const char *source)
+{
+    if (auto failure = called(__func__, lun->uuid, source))
+        return *failure;
+    const LUN *known = findLUN(lun->uuid);
+    if (!known)
+        return NORV_ERR_NO_SUCH_LUN;
+    if (model().exports.count(source) == 0)
+        return NORV_ERR_FILE_NOT_FOUND;
+    return known->is_locked ? NORV_ERR_LUN_LOCKED : 0;
+}
+
+int NORViSCSILunImportCancel(const _tag_iscsi_lun_ *lun)
+{
+    if (auto failure = called(__func__, lun->uuid))
+        return *failure;
+    LUN *known = findLUN(lun->uuid);
+    if (!known)
+        return NORV_ERR_NO_SUCH_LUN;
+    if (!known->is_locked)
+        return NORV_ERR_FILE_NOT_FOUND;
+    known->is_locked = false;
+    return 0;
+}
+
+int NORViSCSISnapshotExportConfigGet(const char *directory, _tag_iscsi_export_config_ *config)
+{
+    if (auto failure = called(__func__, directory))
+        return *failure;
+    const auto found = model().exports.find(directory);
+    return copyRecord(found == model().exports.end() ? nullptr : &found->second, config, NORV_ERR_FILE_NOT_FOUND);
+}
