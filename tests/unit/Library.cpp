@@ -6,8 +6,12 @@
 #include <cstdlib>
 #include <ctime>
 #include <filesystem>
+#include <fstream>
 #include <memory>
+#include <set>
 #include <stdexcept>
+
+#include <unistd.h>
 
 namespace unit {
 namespace {
@@ -43,6 +47,14 @@ std::string withoutPlace(const fake::LogLine &line)
     return (is_tagged ? "[E] " : "") + method + ": " + text;
 }
 
+std::set<std::string> written;
+
+void waitForWorkers()
+{
+    for (int status : fake::waitForChildren())
+        EXPECT_EQ(status, 0) << "of a worker";
+}
+
 } // namespace
 
 LibraryTest::LibraryTest()
@@ -58,10 +70,14 @@ LibraryTest::~LibraryTest()
 {
     logged(); // for its checks, on what the test did not look at
     EXPECT_EQ(fake::unfreedAnswers(), 0);
+    for (const auto &path : written)
+        std::filesystem::remove(path);
+    written.clear();
 }
 
 Lines logged()
 {
+    waitForWorkers();
     Lines lines;
     for (const auto &line : fake::logLines())
         lines.push_back(withoutPlace(line));
@@ -71,6 +87,7 @@ Lines logged()
 
 Lines called()
 {
+    waitForWorkers();
     Lines lines;
     for (const auto &call : fake::calls())
         lines.push_back(call.name + "(" + call.arguments + ")");
@@ -101,6 +118,46 @@ fake::LUN &addLUN(int lid, const std::string &name, int type)
 _tag_iscsi_lun_ recordOf(int lid)
 {
     return fake::model().luns.at(lid).record;
+}
+
+std::string snapshotUUIDOf(int lid, int number)
+{
+    char uuid[37];
+    snprintf(uuid, sizeof(uuid), "5e4d3c2b-%04d-4000-8000-%012d", number, lid);
+    return uuid;
+}
+
+fake::Snapshot &addSnapshot(int lid, int number, const std::string &name)
+{
+    fake::Snapshot snapshot;
+    auto &record = snapshot.record;
+    record.lid = lid;
+    record.snap_id = number;
+    record.total_size = GIB;
+    record.mapped_size = 65536;
+    record.create_time = EPOCH + 60;
+    record.snap_time = EPOCH + number;
+    record.app_consistent = 1;
+    name.copy(record.name, sizeof(record.name) - 1);
+    std::string("Healthy").copy(record.status, sizeof(record.status) - 1);
+    std::string("before the move").copy(record.desc, sizeof(record.desc) - 1);
+    std::string("/volume1").copy(record.root_path, sizeof(record.root_path) - 1);
+    std::string("alice").copy(record.taken_by, sizeof(record.taken_by) - 1);
+    snapshotUUIDOf(lid, number).copy(record.uuid, sizeof(record.uuid) - 1);
+    snapshotUUIDOf(lid, 9999).copy(record.version, sizeof(record.version) - 1);
+    return fake::model().snapshots[{lid, number}] = snapshot;
+}
+
+void writeFile(const std::string &path, const std::string &text)
+{
+    std::filesystem::create_directories(std::filesystem::path(path).parent_path());
+    std::ofstream(path) << text;
+    written.insert(path);
+}
+
+int privateLUNID()
+{
+    return 1000000 + getpid();
 }
 
 fake::Target &addTarget(int tid, const std::string &name)

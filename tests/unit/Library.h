@@ -32,11 +32,11 @@ protected:
     ~LibraryTest() override;
 };
 
-/// Log lines since the last call: "method: text" for "file:line:method text", ": text" for a head
-/// without method, "[E] method: text" for the tagged form.
+/// Log lines since the last call, once detached workers have ended: "method: text" for "file:line:method text", ":
+/// text" for a head without method, "[E] method: text" for the tagged form.
 Lines logged();
 
-/// Platform calls since the last call, as "Name(arguments)".
+/// Platform calls since the last call, once detached workers have ended, as "Name(arguments)".
 Lines called();
 
 std::string uuidOf(int lid);
@@ -44,6 +44,18 @@ std::string uuidOf(int lid);
 /// A LUN in the fake's model: 1 GiB in /volume1, with extents of 64 KiB.
 fake::LUN &addLUN(int lid, const std::string &name, int type = NORV_LUN_TYPE_ADV);
 _tag_iscsi_lun_ recordOf(int lid);
+
+std::string snapshotUUIDOf(int lid, int number);
+
+/// A snapshot in the fake's model: 1 GiB, taken `number` seconds after EPOCH.
+fake::Snapshot &addSnapshot(int lid, int number, const std::string &name);
+constexpr int EPOCH = 1234571490; ///< Sat Feb 14 00:31:30 UTC 2009
+
+/// Writes a file, which goes when the test ends.
+void writeFile(const std::string &path, const std::string &text);
+
+/// A LUN ID that no other test program uses now, for paths made of it. The platform's own end at 1024.
+int privateLUNID();
 
 /// An enabled target in the fake's model, with CHAP in both directions.
 fake::Target &addTarget(int tid, const std::string &name);

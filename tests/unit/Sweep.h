@@ -25,6 +25,7 @@ struct Failure {
     int code;         ///< INJECTED: the failing call's own
     Lines lines;
     bool goes_on = false;     ///< to further platform calls
+    bool has_outputs = false; ///< those of success
     std::string outputs = {}; ///< when other than the operation's `untouched`
 
     Failure leaving(const std::string &other_outputs) const
@@ -47,6 +48,20 @@ template <class... Texts>
 Failure goesOn(const std::string &call, const Texts &...lines)
 {
     return {call, 0, {lines...}, true};
+}
+
+/// The failing call is the last of the operation's detached worker; the caller has had its success.
+template <class... Texts>
+Failure endsWorker(const std::string &call, const Texts &...lines)
+{
+    return {call, 0, {lines...}, false, true};
+}
+
+/// The worker goes on.
+template <class... Texts>
+Failure workerGoesOn(const std::string &call, const Texts &...lines)
+{
+    return {call, 0, {lines...}, true, true};
 }
 
 struct Operation {
