@@ -36,6 +36,13 @@ std::string fake::mapFilePath(const _tag_iscsi_lun_ &lun)
            (has_long_number ? "_00000" : "_000");
 }
 
+std::string fake::dataPath(const _tag_iscsi_snapshot_ &snapshot)
+{
+    return textOf(snapshot.root_path) + (snapshot.flags & NORV_SNAPSHOT_TRASH ? "/@EP_trash" : "/@Snapshot") +
+           "/SNAPSHOT_L" + std::to_string(snapshot.lid) + "_S" + std::to_string(snapshot.snap_id) + "_" +
+           textOf(snapshot.name);
+}
+
 int NORVExtentPoolMapFileMappedSizeGet(const char *path, const char *location, uint64_t *size)
 {
     if (auto failure = called(__func__, path, location))
@@ -88,6 +95,13 @@ int NORViSCSIChildLunSyncProgressGet(const char *path, uint64_t *done, uint64_t 
 {
     if (auto failure = called(__func__, path))
         return *failure;
+    for (const auto &[key, snapshot] : model().snapshots) {
+        if (dataPath(snapshot.record) == path) {
+            *done = snapshot.copied;
+            *total = snapshot.to_copy;
+            return 0;
+        }
+    }
     const MapFile *file = byPath(path);
     if (!file)
         return NORV_ERR_FILE_NOT_FOUND;

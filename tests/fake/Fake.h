@@ -40,6 +40,7 @@ struct Snapshot {
     bool is_loaded = false;
     bool is_locked = false; ///< by an action
     std::set<std::string> app_keys;
+    uint64_t copied = 0, to_copy = 0; ///< of the replication that fills it
 };
 
 struct Target {
@@ -76,6 +77,9 @@ void reset();
 
 /// Where a LUN's map file is, by the platform's own naming rule.
 std::string mapFilePath(const _tag_iscsi_lun_ &lun);
+
+/// The same of a snapshot's data.
+std::string dataPath(const _tag_iscsi_snapshot_ &snapshot);
 
 /// A call as it was made: the function and its key arguments, separated by ", ".
 struct Call {

@@ -33,7 +33,7 @@ protected:
 };
 
 /// Log lines since the last call, once detached workers have ended: "method: text" for "file:line:method text", ":
-/// text" for a head without method, "[E] method: text" for the tagged form.
+/// text" for a head without method, "[E] method: text" for the tagged form; addresses stand as {addresses}.
 Lines logged();
 
 /// Platform calls since the last call, once detached workers have ended, as "Name(arguments)".

@@ -275,22 +275,25 @@ TEST_F(SnapshotRecord, AppKeysLockAndUnlock)
 
 TEST_F(SnapshotRecord, SyncProgressIsThatOfTheDataPath)
 {
-    auto &record = addSnapshot(7, 3, "daily").record;
-    std::string("/vol1").copy(record.root_path, sizeof(record.root_path));
-    record.root_path[5] = '\0';
-    unsigned long long done = 9, total = 9;
-    const std::string map_file = fake::mapFilePath(addLUN(7, "vol1").record);
-    for (const auto &[flags, folder] : {std::pair<int, const char *>{0, "@Snapshot"}, {9, "@EP_trash"}}) {
-        record.flags = static_cast<uint32_t>(flags);
+    auto &daily = addSnapshot(7, 3, "daily");
+    auto &record = daily.record;
+    strcpy(record.root_path, "/vol1");
+    unsigned long long done = 0, total = 0;
+    for (const auto &[flags, folder] : {std::pair<uint32_t, const char *>{8, "@Snapshot"}, {9, "@EP_trash"}}) {
+        record.flags = flags;
+        daily.copied = flags;
+        daily.to_copy = 1ULL << 40;
         called();
-        EXPECT_NE(snapshot.loadSyncProgress(done, total), 0) << "there is no such map file";
+        EXPECT_EQ(snapshot.loadSyncProgress(done, total), 0);
         EXPECT_EQ(called().back(),
                   std::string("NORViSCSIChildLunSyncProgressGet(/vol1/") + folder + "/SNAPSHOT_L7_S3_daily)");
+        EXPECT_EQ(done, flags);
+        EXPECT_EQ(total, 1ULL << 40);
     }
-    EXPECT_EQ(done + total, 18u);
     memset(record.root_path, 'r', sizeof(record.root_path));
-    EXPECT_NE(snapshot.loadSyncProgress(done, total), 0);
+    EXPECT_EQ(snapshot.loadSyncProgress(done, total), 18990011);
     EXPECT_EQ(called().back(), "NORViSCSIChildLunSyncProgressGet(" + std::string(319, 'r') + ")");
+    EXPECT_EQ(done, 9u) << "untouched";
 }
 
 TEST_F(SnapshotRecord, ExportProgressIsReadFromItsFile)

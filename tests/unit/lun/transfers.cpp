@@ -1,0 +1,184 @@
+// Export, import, and their progress.
+#include "iscsiwebapi/ISCSILIBLUN.h"
+#include "tests/unit/Library.h"
+
+#include <limits>
+
+namespace unit {
+namespace {
+
+using ISCSI::LIB::LIBLUN::ISCSILIBLUN;
+
+const std::string SNAPSHOT = snapshotUUIDOf(3, 2);
+
+class Transfers : public LibraryTest {
+protected:
+    Transfers()
+    {
+        addLUN(lid, "vol1");
+        addSnapshot(3, 2, "daily");
+        fake::model().exports["/export"] = {{}, "a note", "bob", EPOCH, 1, 0, {}};
+    }
+
+    const int lid = privateLUNID();
+    const std::string progress_file = "/tmp/iscsi/L" + std::to_string(lid) + ".import_progress";
+    ISCSILIBLUN lun{uuidOf(lid)};
+
+    const std::string lun_loaded = "NORViSCSILunConfigGetByUUID(" + uuidOf(lid) + ", 0)";
+    const std::string loaded = "NORViSCSISnapshotConfGetByUUID(" + SNAPSHOT + ")";
+    const std::string forked = "NLIBCProcForkChildNoWait()";
+
+    std::string waited(int limit) const
+    {
+        return "NORViSCSILunWaitUntilUnlock(" + uuidOf(lid) + ", " + std::to_string(limit) + ")";
+    }
+    std::string standardLine(const std::string &sentence, const std::string &error) const
+    {
+        return "importLUN: " + sentence + " info: " + lun.info.toString() + ". error: " + error;
+    }
+    std::string closingLine(const std::string &error) const
+    {
+        return "[E] importLUN: error code: " + error + " [" + lun.info.toString() + "]";
+    }
+};
+
+TEST_F(Transfers, ExportStartsAndItsCancelWaits)
+{
+    EXPECT_EQ(lun.exportLUN(SNAPSHOT, "/export/two"), 0);
+    EXPECT_EQ(called(), (Lines{loaded, "NORViSCSISnapshotExport(" + SNAPSHOT + ", /export/two)"}));
+    EXPECT_STREQ(fake::model().exports.at("/export/two").desc, "before the move");
+
+    fake::model().snapshots.at({3, 2}).is_locked = true;
+    EXPECT_EQ(lun.exportCancel(SNAPSHOT), 0);
+    const std::string cancelled = "NORViSCSISnapshotExportCancel(" + SNAPSHOT + ")";
+    EXPECT_EQ(called(), (Lines{loaded, cancelled, "NORViSCSISnapshotWaitUntilUnlock(" + SNAPSHOT + ", 180)"}));
+    EXPECT_EQ(lun.exportCancel(SNAPSHOT), 18990011) << "the platform's code";
+    EXPECT_EQ(called(), (Lines{loaded, cancelled}));
+}
+
+TEST_F(Transfers, ASuccessfulImportEndsWithASnapshotLikeTheExported)
+{
+    writeFile(progress_file, "step=0\n");
+    EXPECT_EQ(lun.importLUN("/export"), 0);
+    EXPECT_EQ(
+        called(),
+        (Lines{lun_loaded, "NORViSCSILunImport(" + uuidOf(lid) + ", /export)", forked, waited(0),
+               "NLIBCFileGetKeyValue(" + progress_file + ", step, 32)", "NORViSCSISnapshotExportConfigGet(/export)",
+               lun_loaded, "NORViSCSIUnusedSnapshotNameFind(" + std::to_string(lid) + ", 256)",
+               "NORViSCSISnapshotCreate(" + uuidOf(lid) + ", auto-1, a note, bob, 1234571490, 0, 1, 0)", forked,
+               waited(1800), "NORVRETENTIONRunPolicy(Lun#, " + std::to_string(lid) + ", snapshot hooks, 0)"}));
+    EXPECT_EQ(logged(), Lines());
+
+    fake::model().exports["/export"] = {{}, "", "", EPOCH, 0, 1, {}};
+    EXPECT_EQ(lun.importLUN("/export"), 0);
+    EXPECT_EQ(called().at(8), "NORViSCSISnapshotCreate(" + uuidOf(lid) + ", auto-1, , webapi, 1234571490, 0, 0, 1)");
+}
+
+TEST_F(Transfers, AnImportThatIsNoSuccessTakesNoSnapshot)
+{
+    const std::string unread = "Failed to get the status of import.";
+    const std::string failed = "The status of import is not success.";
+    const struct {
+        std::string file, sentence, error;
+        bool has_closing_line;
+    } cases[] = {
+        {"step=18990002\n", failed, "18990002 (Out of free space)", true},
+        {"step=-3\n", failed, "-3 (No such process)", true},
+        {"step=" + std::string(31, '7') + "\n", failed, "", true},
+        {"done_bytes=1\n", unread, "0 (Success)", false},
+        {"step=" + std::string(32, '0') + "\n", unread, "-1 (Operation not permitted)", true}, // no room for the value
+    };
+    for (const auto &c : cases) {
+        writeFile(progress_file, c.file);
+        EXPECT_EQ(lun.importLUN("/export"), 0);
+        EXPECT_EQ(called().size(), 5u) << c.file;
+        const Lines lines = logged();
+        ASSERT_EQ(lines.size(), c.has_closing_line ? 2u : 1u) << c.file;
+        EXPECT_EQ(lines[0].find("importLUN: " + c.sentence), 0u);
+        if (c.error.empty())
+            continue;
+        EXPECT_EQ(lines[0], standardLine(c.sentence, c.error));
+        if (c.has_closing_line) {
+            EXPECT_EQ(lines[1], closingLine(c.error));
+        }
+    }
+}
+
+TEST_F(Transfers, TheWorkerNamesWhatItMissed)
+{
+    EXPECT_EQ(lun.importLUN("/nothing"), 18990011);
+    EXPECT_EQ(called().size(), 2u) << "no worker";
+    EXPECT_EQ(logged(), Lines{standardLine("Failed to import to LUN.", "18990011 (File not found)")});
+
+    writeFile(progress_file, "step=\"0\"\n");
+    fake::failCall("NORViSCSISnapshotExportConfigGet", 1, INJECTED);
+    EXPECT_EQ(lun.importLUN("/export"), 0);
+    EXPECT_EQ(logged(), (Lines{standardLine("Failed to get export config from directory '/export'", INJECTED_ERROR),
+                               closingLine(INJECTED_ERROR)}));
+
+    fake::failCall("NLIBCProcForkChildNoWait", 2, -1);
+    EXPECT_EQ(lun.importLUN("/export"), 0);
+    const Lines lines = logged();
+    ASSERT_EQ(lines.size(), 3u);
+    EXPECT_EQ(lines[1], standardLine("Failed to take snapshot when import done.", "18990014 (Failed to fork)"));
+    EXPECT_EQ(lines[2], closingLine("18990014 (Failed to fork)"));
+}
+
+TEST_F(Transfers, ImportCancelWaits)
+{
+    fake::model().luns.at(lid).is_locked = true;
+    EXPECT_EQ(lun.importCancel(), 0);
+    EXPECT_EQ(called(), (Lines{lun_loaded, "NORViSCSILunImportCancel(" + uuidOf(lid) + ")", waited(180)}));
+    EXPECT_EQ(lun.importCancel(), 18990011);
+    EXPECT_EQ(called().size(), 2u);
+}
+
+TEST_F(Transfers, ImportProgressIsReadFromItsFile)
+{
+    unsigned long long done = 9, total = 9;
+    int step = 9;
+    EXPECT_EQ(lun.getImportProgress(done, total, step), 0);
+    EXPECT_EQ(done + total, 0u);
+    EXPECT_EQ(step, 18990593);
+    EXPECT_EQ(called(), (Lines{lun_loaded, "NLIBCFileExist(" + progress_file + ")"}));
+
+    const struct {
+        const char *text, *missing;
+        int step;
+        unsigned long long done, total;
+    } cases[] = {
+        {"step=2\ndone_bytes=18446744073709551615\ntotal_bytes=\"20\"\n", nullptr, 2,
+         std::numeric_limits<unsigned long long>::max(), 20},
+        {"step=0x2\ndone_bytes=0x10\ntotal_bytes=010\n", nullptr, 0, 0, 10}, // decimal only
+        {"done_bytes=10\ntotal_bytes=20\n", "step", 9, 9, 9},
+        {"step=5\n", "done_bytes", 5, 9, 9},
+        {"step=5\ndone_bytes=10\n", "total_bytes", 5, 10, 9},
+    };
+    for (const auto &c : cases) {
+        writeFile(progress_file, c.text);
+        done = total = 9;
+        step = 9;
+        EXPECT_EQ(lun.getImportProgress(done, total, step), c.missing ? 18990017 : 0) << c.text;
+        Lines lines;
+        if (c.missing)
+            lines = {"getImportProgress: Failed to get import progress from '" + progress_file +
+                     "': key = " + c.missing};
+        EXPECT_EQ(logged(), lines);
+        EXPECT_EQ(step, c.step) << c.text;
+        EXPECT_EQ(done, c.done) << c.text;
+        EXPECT_EQ(total, c.total) << c.text;
+    }
+}
+
+TEST_F(Transfers, SyncProgressIsThatOfTheLUN)
+{
+    fake::model().luns.at(lid).map_file.copied = 3;
+    fake::model().luns.at(lid).map_file.to_copy = 5;
+    unsigned long long done = 9, total = 9;
+    EXPECT_EQ(lun.getSyncProgress(done, total), 0);
+    EXPECT_EQ(done, 3u);
+    EXPECT_EQ(total, 5u);
+}
+
+} // namespace
+} // namespace unit
