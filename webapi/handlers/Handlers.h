@@ -3,6 +3,10 @@
 
 #include "webapi/handlers/Route.h"
 
+namespace ISCSI {
+class ISCSISnapshotInfo;
+}
+
 namespace webapi {
 
 /// The IQN text that stands for the default masking entry, in input and in answers.
@@ -30,9 +34,41 @@ Result showMasks(const Request &request);
 Result setMasks(const Request &request);
 Result changeMasks(const Request &request);
 
+Result listSnapshots(const Request &request);
+Result takeSnapshot(const Request &request);
+Result showSnapshot(const Request &request);
+Result deleteSnapshot(const Request &request);
+Result restoreSnapshot(const Request &request);
+Result lockSnapshot(const Request &request);
+Result unlockSnapshot(const Request &request);
+Result stopSnapshot(const Request &request);
+Result loadSnapshot(const Request &request);
+Result unloadSnapshot(const Request &request);
+
+Result cloneSnapshot(const Request &request);
+Result cloneLun(const Request &request);
+Result exportSnapshot(const Request &request);
+Result showExport(const Request &request);
+Result cancelExport(const Request &request);
+Result importLun(const Request &request);
+Result showImport(const Request &request);
+Result cancelImport(const Request &request);
+
+Result showRetention(const Request &request);
+Result setRetention(const Request &request);
+Result removeRetention(const Request &request);
+Result tryRetention(const Request &request);
+Result listSchedules(const Request &request);
+Result addSchedule(const Request &request);
+Result removeSchedule(const Request &request);
+Result listEvents(const Request &request);
+
 /// Resolves a LUN selector to a UUID (which may name no LUN), or a target selector to a target ID
 /// (which may name no target).
 Result selectLun(const std::string &selector, std::string &uuid);
 Result selectTarget(const std::string &selector, int &tid);
+
+/// Loads the snapshot that the request's path selects, with its lock facts, and finds its LUN.
+Result selectSnapshot(const Request &request, ISCSI::ISCSISnapshotInfo &snapshot, std::string &lun_uuid);
 
 } // namespace webapi

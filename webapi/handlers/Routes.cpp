@@ -21,6 +21,11 @@ constexpr uint64_t IQN_MAX_BYTES = 223;     // RFC 7143, 4.2.7.1
 constexpr uint64_t SEGMENT_MIN_BYTES = 512; // RFC 7143, 13.12
 constexpr uint64_t SEGMENT_MAX_BYTES = (1 << 24) - 1;
 constexpr uint64_t MAX_TARGETS = 256;
+constexpr uint64_t NOTE_MAX_BYTES = 1023;
+constexpr uint64_t ACTOR_MAX_BYTES = 31;
+constexpr uint64_t APP_KEY_MAX_BYTES = 127;
+constexpr uint64_t RULE_MAX_BYTES = 255;
+constexpr uint64_t EVENTS_MAX = 10000; // as many as are kept
 constexpr uint64_t MAX_MASKS = 1024; // bounds the work of one request
 
 constexpr Field LUN_LIST[] = {
@@ -83,6 +88,52 @@ constexpr Field MASKS_CHANGE[] = {
     {"remove", Type::List, OPTIONAL, 0, MAX_MASKS, ERR_BAD_TARGET_ACL, nullptr, IQN_ELEMENT},
 };
 
+constexpr Field SNAPSHOT_LIST[] = {
+    {"lun", Type::Text, OPTIONAL, 1, NAME_MAX_BYTES, ERR_BAD_LUN_UUID},
+};
+
+constexpr Field SNAPSHOT_TAKE[] = {
+    {"name", Type::Text, OPTIONAL, 1, NAME_MAX_BYTES, ERR_BAD_SNAPSHOT_NAME},
+    {"description", Type::Text, OPTIONAL, 0, NOTE_MAX_BYTES, ERR_BAD_SNAPSHOT_NOTE},
+    {"taken_by", Type::Text, OPTIONAL, 1, ACTOR_MAX_BYTES, ERR_BAD_PARAMETER},
+    {"is_app_consistent", Type::Boolean, OPTIONAL, 0, 0, 0},
+    {"is_user_locked", Type::Boolean, OPTIONAL, 0, 0, 0},
+    {"is_scheduled", Type::Boolean, OPTIONAL, 0, 0, 0},
+};
+
+constexpr Field SNAPSHOT_DELETE[] = {
+    {"deleted_by", Type::Text, OPTIONAL, 1, ACTOR_MAX_BYTES, ERR_BAD_PARAMETER},
+};
+
+constexpr Field SNAPSHOT_LOCK[] = {
+    {"app_key", Type::Text, OPTIONAL, 1, APP_KEY_MAX_BYTES, ERR_BAD_APP_KEY},
+};
+
+constexpr Field CLONE[] = {
+    {"name", Type::Text, REQUIRED, 1, NAME_MAX_BYTES, ERR_BAD_LUN_NAME},
+};
+
+constexpr Field DIRECTORY[] = {
+    {"directory", Type::Text, REQUIRED, 1, LOCATION_MAX_BYTES, ERR_BAD_EXPORTING_LOCATION},
+};
+
+constexpr Field RETENTION[] = {
+    {"newest", Type::Unsigned, OPTIONAL, 0, INT32_MAX, ERR_BAD_PARAMETER},
+    {"hourly", Type::Unsigned, OPTIONAL, 0, INT32_MAX, ERR_BAD_PARAMETER},
+    {"daily", Type::Unsigned, OPTIONAL, 0, INT32_MAX, ERR_BAD_PARAMETER},
+    {"weekly", Type::Unsigned, OPTIONAL, 0, INT32_MAX, ERR_BAD_PARAMETER},
+};
+
+constexpr Field SCHEDULE[] = {
+    {"lun", Type::Text, REQUIRED, 1, NAME_MAX_BYTES, ERR_BAD_LUN_UUID},
+    {"rule", Type::Text, REQUIRED, 1, RULE_MAX_BYTES, ERR_BAD_PARAMETER},
+};
+
+constexpr Field EVENTS[] = {
+    {"since", Type::Unsigned, OPTIONAL, 0, INT64_MAX, ERR_BAD_PARAMETER},
+    {"count", Type::Unsigned, OPTIONAL, 1, EVENTS_MAX, ERR_BAD_PARAMETER},
+};
+
 constexpr Fields NONE;
 
 } // namespace
@@ -99,6 +150,32 @@ const std::vector<Route> &routes()
         {Method::Post, "/luns/{lun}/unmap", Role::Admin, LUN_MAPPING, unmapLun},
         {Method::Post, "/luns/{lun}/load", Role::Admin, LUN_LOADING, loadLun},
         {Method::Post, "/luns/{lun}/unload", Role::Admin, LUN_LOADING, unloadLun},
+        {Method::Post, "/luns/{lun}/clone", Role::Admin, CLONE, cloneLun},
+        {Method::Get, "/luns/{lun}/import", Role::Viewer, NONE, showImport},
+        {Method::Post, "/luns/{lun}/import", Role::Admin, DIRECTORY, importLun},
+        {Method::Delete, "/luns/{lun}/import", Role::Admin, NONE, cancelImport},
+        {Method::Get, "/luns/{lun}/retention", Role::Viewer, NONE, showRetention},
+        {Method::Put, "/luns/{lun}/retention", Role::Admin, RETENTION, setRetention},
+        {Method::Delete, "/luns/{lun}/retention", Role::Admin, NONE, removeRetention},
+        {Method::Get, "/luns/{lun}/retention/verdicts", Role::Viewer, RETENTION, tryRetention},
+        {Method::Post, "/luns/{lun}/snapshots", Role::Admin, SNAPSHOT_TAKE, takeSnapshot},
+        {Method::Get, "/snapshots", Role::Viewer, SNAPSHOT_LIST, listSnapshots},
+        {Method::Get, "/snapshots/{snapshot}", Role::Viewer, NONE, showSnapshot},
+        {Method::Delete, "/snapshots/{snapshot}", Role::Admin, SNAPSHOT_DELETE, deleteSnapshot},
+        {Method::Post, "/snapshots/{snapshot}/restore", Role::Admin, NONE, restoreSnapshot},
+        {Method::Post, "/snapshots/{snapshot}/clone", Role::Admin, CLONE, cloneSnapshot},
+        {Method::Post, "/snapshots/{snapshot}/lock", Role::Admin, SNAPSHOT_LOCK, lockSnapshot},
+        {Method::Post, "/snapshots/{snapshot}/unlock", Role::Admin, SNAPSHOT_LOCK, unlockSnapshot},
+        {Method::Post, "/snapshots/{snapshot}/stop", Role::Admin, NONE, stopSnapshot},
+        {Method::Post, "/snapshots/{snapshot}/load", Role::Admin, LUN_LOADING, loadSnapshot},
+        {Method::Post, "/snapshots/{snapshot}/unload", Role::Admin, LUN_LOADING, unloadSnapshot},
+        {Method::Get, "/snapshots/{snapshot}/export", Role::Viewer, NONE, showExport},
+        {Method::Post, "/snapshots/{snapshot}/export", Role::Admin, DIRECTORY, exportSnapshot},
+        {Method::Delete, "/snapshots/{snapshot}/export", Role::Admin, NONE, cancelExport},
+        {Method::Get, "/schedules", Role::Viewer, NONE, listSchedules},
+        {Method::Post, "/schedules", Role::Admin, SCHEDULE, addSchedule},
+        {Method::Delete, "/schedules/{schedule}", Role::Admin, NONE, removeSchedule},
+        {Method::Get, "/events", Role::Viewer, EVENTS, listEvents},
         {Method::Get, "/targets", Role::Viewer, TARGET_LIST, listTargets},
         {Method::Post, "/targets", Role::Admin, TARGET_CREATE, createTarget},
         {Method::Get, "/targets/{target}", Role::Viewer, NONE, showTarget},
