@@ -51,6 +51,17 @@ int readOnlyRow(Query &query, const std::string &selector, SnapshotRow &row)
     return 0;
 }
 
+int visitRows(Query &query, const std::function<int(const SnapshotRow &)> &visit)
+{
+    SnapshotRow row;
+    while (query.next()) {
+        readRow(query, row);
+        if (int err = visit(row))
+            return err;
+    }
+    return query.error();
+}
+
 Query &bindLoadedNumber(Query &query, int number)
 {
     return number ? query.bind(number) : query.bindNull();
@@ -113,13 +124,14 @@ int forEachSnapshot(int lid, int64_t since, const std::function<int(const Snapsh
     query.bind(since);
     if (lid)
         query.bind(lid);
-    SnapshotRow row;
-    while (query.next()) {
-        readRow(query, row);
-        if (int err = visit(row))
-            return err;
-    }
-    return query.error();
+    return visitRows(query, visit);
+}
+
+int forEachLoadedSnapshot(int tid, const std::function<int(const SnapshotRow &)> &visit)
+{
+    Query query(SELECT_SNAPSHOTS "JOIN mappings m ON m.lid = s.lid "
+                                 "WHERE m.tid = ?1 AND s.loaded_number IS NOT NULL ORDER BY s.loaded_number");
+    return visitRows(query.bind(tid), visit);
 }
 
 int loadSnapshotsOfLun(int lid, std::vector<SnapshotRow> &rows)

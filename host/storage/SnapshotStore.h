@@ -28,6 +28,8 @@ int loadSnapshotByName(int lid, std::string_view name, SnapshotRow &row);
 /// Shows the snapshots taken at `since` or later, of one LUN or with `lid` 0 of all, by LUN ID and number. A visitor's
 /// code other than 0 ends it.
 int forEachSnapshot(int lid, int64_t since, const std::function<int(const SnapshotRow &)> &visit);
+/// The loaded ones of the LUNs that are mapped to a target, by LUN number.
+int forEachLoadedSnapshot(int tid, const std::function<int(const SnapshotRow &)> &visit);
 int loadSnapshotsOfLun(int lid, std::vector<SnapshotRow> &rows);
 
 /// The lowest number that the LUN has no snapshot under: NORV_ERR_MAX_SNAPSHOTS when there is none.

@@ -21,6 +21,7 @@ HostTest::HostTest()
     mkdir(volume.c_str(), 0700);
     setenv("ISCSI_HOST_STATE", (root + "/state").c_str(), 1);
     setenv("ISCSI_HOST_RUN", (root + "/run").c_str(), 1);
+    setenv("ISCSI_HOST_PROGRESS", (root + "/progress").c_str(), 1);
     EXPECT_EQ(0, iscsihost::addVolume(volume)) << iscsi_host_last_error();
 }
 
@@ -86,7 +87,8 @@ std::set<std::string> HostTest::files()
     for (const char *folder : {data_folder, trash_folder})
         if (exists(volume + "/" + folder))
             for (const auto &entry : std::filesystem::directory_iterator(volume + "/" + folder))
-                found.insert(entry.path());
+                if (!entry.is_directory())
+                    found.insert(entry.path());
     return found;
 }
 

@@ -1,13 +1,13 @@
 /// What a kill at any moment leaves: a whole LUN or none, no lock, nothing that the next command or the sweep does
 /// not put right.
 #include "HostTest.h"
+#include "KillAt.h"
 
 #include "host/state/Database.h"
 
 #include <chrono>
 #include <poll.h>
 #include <random>
-#include <sys/ptrace.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -15,32 +15,6 @@ namespace norvhost {
 namespace {
 
 struct KillTest : HostTest {
-    /// Kills a process of its own before the n-th system call of the work; false when the work ended before.
-    bool killAtSystemCall(int n, const std::function<int()> &work)
-    {
-        const pid_t child = inChild([&] {
-            if (openDatabase() != 0 || ptrace(PTRACE_TRACEME, 0, nullptr, nullptr) != 0)
-                return 99;
-            raise(SIGSTOP);
-            return work();
-        });
-        int status = 0;
-        // A call stops the process twice, as it begins and as it ends; the work changes nothing in between two calls.
-        for (int stops = 0;; ++stops) {
-            EXPECT_EQ(child, waitpid(child, &status, 0));
-            if (!WIFSTOPPED(status)) {
-                EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << "status " << status;
-                return false;
-            }
-            if (stops == 2 * n)
-                break;
-            ptrace(PTRACE_SYSCALL, child, nullptr, nullptr);
-        }
-        kill(child, SIGKILL);
-        waitpid(child, &status, 0);
-        return true;
-    }
-
     /// Kills the work at each of its system calls, from the same beginning each time.
     void killEverywhere(const std::function<void()> &prepare, const std::function<int()> &work)
     {
