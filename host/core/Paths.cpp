@@ -28,6 +28,11 @@ std::string runFolder()
     return environmentOr("ISCSI_HOST_RUN", "/run/iscsi-host");
 }
 
+std::string progressFolder()
+{
+    return environmentOr("ISCSI_HOST_PROGRESS", "/tmp/iscsi");
+}
+
 int makeFolder(const std::string &path)
 {
     for (size_t slash = path.find('/', 1); slash != std::string::npos; slash = path.find('/', slash + 1))

@@ -11,6 +11,9 @@ std::string stateFolder();
 /// $ISCSI_HOST_RUN, else /run/iscsi-host: sockets, process IDs and locks.
 std::string runFolder();
 
+/// $ISCSI_HOST_PROGRESS, else /tmp/iscsi, where readers look: the progress files of exports and imports.
+std::string progressFolder();
+
 /// Makes a folder with mode 0700, its missing parents with 0755. An existing folder is left as it is.
 /// 0, else an error code.
 int makeFolder(const std::string &path);

@@ -139,6 +139,20 @@ ALTER TABLE schedules ADD COLUMN next_run INTEGER NOT NULL DEFAULT 0;
 ALTER TABLE schedules ADD COLUMN last_run INTEGER NOT NULL DEFAULT 0;
 ALTER TABLE schedules ADD COLUMN options TEXT NOT NULL DEFAULT '{}';
 )sql",
+
+    R"sql(
+-- Exports and imports under way; the number is 0 for an import into the LUN. A row outlives the worker that was killed,
+-- and its snapshot, so that what the worker left is found. State 0: runs, 1: is to stop, 2: cannot be stopped any more.
+CREATE TABLE transfers (
+    lid INTEGER NOT NULL,
+    snap_id INTEGER NOT NULL,
+    folder TEXT NOT NULL,
+    made_folder INTEGER NOT NULL CHECK (made_folder IN (0, 1)),
+    state INTEGER NOT NULL DEFAULT 0 CHECK (state IN (0, 1, 2)),
+    PRIMARY KEY (lid, snap_id)
+) STRICT, WITHOUT ROWID;
+CREATE UNIQUE INDEX folders_of_exports ON transfers (folder) WHERE snap_id > 0;
+)sql",
 };
 
 constexpr int latest = static_cast<int>(std::size(steps));

@@ -61,11 +61,6 @@ int extendAllocated(int fd, uint64_t from, uint64_t to, LunLock &progress)
     return 0;
 }
 
-int extend(int fd, const _tag_iscsi_lun_ &lun, uint64_t from, uint64_t to, LunLock &progress)
-{
-    return isFullyAllocated(lun.type) ? extendAllocated(fd, from, to, progress) : extendSparse(fd, to);
-}
-
 std::string readTextAttribute(const std::string &path, const char *name)
 {
     char text[64];
@@ -109,6 +104,11 @@ int writeFileMark(int fd, const std::string &uuid, const std::string &snapshot)
     return 0;
 }
 
+int sizeDataFile(int fd, const _tag_iscsi_lun_ &lun, uint64_t from, uint64_t to, LunLock &progress)
+{
+    return isFullyAllocated(lun.type) ? extendAllocated(fd, from, to, progress) : extendSparse(fd, to);
+}
+
 int makeFile(const std::string &path, const std::function<int(int fd)> &fill)
 {
     const std::string folder = parentOf(path);
@@ -144,7 +144,7 @@ int createDataFile(const _tag_iscsi_lun_ &lun, const std::function<int(int fd)> 
 
 int createDataFile(const _tag_iscsi_lun_ &lun, LunLock &progress)
 {
-    return createDataFile(lun, [&](int fd) { return extend(fd, lun, 0, lun.size, progress); });
+    return createDataFile(lun, [&](int fd) { return sizeDataFile(fd, lun, 0, lun.size, progress); });
 }
 
 int growDataFile(const _tag_iscsi_lun_ &lun, uint64_t size, LunLock &progress)
@@ -153,7 +153,7 @@ int growDataFile(const _tag_iscsi_lun_ &lun, uint64_t size, LunLock &progress)
     const FileDescriptor file(open(path.c_str(), O_RDWR | O_NOFOLLOW | O_CLOEXEC));
     if (!file)
         return failErrno(NORV_ERR_OPEN_FILE, errno, "cannot open the LUN's file %s", path.c_str());
-    int err = extend(file.get(), lun, lun.size, size, progress);
+    int err = sizeDataFile(file.get(), lun, lun.size, size, progress);
     if (!err && fsync(file.get()) != 0)
         err = failErrno(NORV_ERR_WRITE_FILE, errno, "cannot flush the LUN's file");
     if (err)

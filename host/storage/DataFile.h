@@ -20,6 +20,9 @@ int createDataFile(const _tag_iscsi_lun_ &lun, LunLock &progress);
 /// Makes the LUN's map file by makeFile() with the data that `fill` writes.
 int createDataFile(const _tag_iscsi_lun_ &lun, const std::function<int(int fd)> &fill);
 
+/// Sets the size of a map file, allocated in full where the LUN's kind is.
+int sizeDataFile(int fd, const _tag_iscsi_lun_ &lun, uint64_t from, uint64_t to, LunLock &progress);
+
 /// Grows the map file to `size`; after a failure it has its old size.
 int growDataFile(const _tag_iscsi_lun_ &lun, uint64_t size, LunLock &progress);
 

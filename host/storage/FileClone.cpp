@@ -69,6 +69,67 @@ int nextData(int fd, uint64_t at, uint64_t size, uint64_t &begin, uint64_t &end)
     return 0;
 }
 
+/// Starts writing out what was copied, and waits for what was copied before: the disk works while we read, and neither
+/// the final flush nor a stop has much to wait for.
+class WriteBehind {
+public:
+    explicit WriteBehind(int fd) : fd(fd) {}
+
+    /// For ascending ranges.
+    void wrote(uint64_t begin, uint64_t end)
+    {
+        copied += end - begin;
+        if (copied < step)
+            return;
+        // Hints only: a failure to write is told by the fsync() that follows.
+        sync(started, end, SYNC_FILE_RANGE_WRITE);
+        sync(finished, started, SYNC_FILE_RANGE_WAIT_BEFORE | SYNC_FILE_RANGE_WRITE | SYNC_FILE_RANGE_WAIT_AFTER);
+        finished = started;
+        started = end;
+        copied = 0;
+    }
+
+private:
+    static constexpr uint64_t step = 16 << 20;
+
+    void sync(uint64_t begin, uint64_t end, unsigned flags)
+    {
+        if (begin < end)
+            sync_file_range(fd, static_cast<off_t>(begin), static_cast<off_t>(end - begin), flags);
+    }
+
+    int fd;
+    uint64_t finished = 0, started = 0; ///< the disk has what lies before, and works on what lies between
+    uint64_t copied = 0;                ///< bytes that it was not told of yet
+};
+
+/// Copies the data between holes, and makes holes where `to`, up to its old size, may hold data.
+int copyExtents(int from, int to, uint64_t old_size, const BytesProgress &progress)
+{
+    uint64_t size, done = 0;
+    if (int err = fileSize(from, size))
+        return err;
+    posix_fadvise(from, 0, 0, POSIX_FADV_SEQUENTIAL);
+    WriteBehind behind(to);
+    std::vector<char> buffer(copy_step);
+    for (uint64_t at = 0, begin, end; at < size; at = end) {
+        if (int err = nextData(from, at, size, begin, end))
+            return err;
+        if (int err = punchHole(to, at, std::min(begin, old_size)))
+            return err;
+        for (uint64_t part = begin; part < end; part += copy_step) {
+            const uint64_t part_end = std::min<uint64_t>(part + copy_step, end);
+            if (int err = progress(done))
+                return err;
+            if (int err = copyRange(from, to, part, part_end, buffer))
+                return err;
+            behind.wrote(part, part_end);
+            done += part_end - part;
+        }
+    }
+    return progress(done);
+}
+
 /// Once for each volume: the administrator chose the file system, and may choose another.
 void sayThatItCopies(const std::string &volume)
 {
@@ -105,30 +166,38 @@ int shareBlocks(int from, int to, bool &shared)
                      buffer);
 }
 
+int countData(int fd, uint64_t &bytes)
+{
+    uint64_t size;
+    if (int err = fileSize(fd, size))
+        return err;
+    bytes = 0;
+    for (uint64_t at = 0, begin, end; at < size; at = end) {
+        if (int err = nextData(fd, at, size, begin, end))
+            return err;
+        bytes += end - begin;
+    }
+    return 0;
+}
+
+int copyData(int from, int to, const BytesProgress &progress)
+{
+    return copyExtents(from, to, 0, progress);
+}
+
 int copySparsely(int from, int to, const CopyProgress &progress)
 {
-    uint64_t size, target_size;
+    uint64_t size, target_size, total;
     if (int err = fileSize(from, size))
         return err;
     if (int err = fileSize(to, target_size))
         return err;
+    if (int err = countData(from, total))
+        return err;
     if (target_size < size && ftruncate(to, static_cast<off_t>(size)) != 0)
         return failErrno(NORV_ERR_TRUNCATE_FILE, errno, "cannot set the size of a data file");
-
-    std::vector<char> buffer(copy_step);
-    for (uint64_t at = 0, begin, end; at < size; at = end) {
-        if (int err = nextData(from, at, size, begin, end))
-            return err;
-        if (int err = punchHole(to, at, std::min(begin, target_size)))
-            return err;
-        for (uint64_t part = begin; part < end; part += copy_step) {
-            if (int err = progress(static_cast<int>(part / (size / 100 + 1))))
-                return err;
-            if (int err = copyRange(from, to, part, std::min<uint64_t>(part + copy_step, end), buffer))
-                return err;
-        }
-    }
-    return 0;
+    return copyExtents(from, to, target_size,
+                       [&](uint64_t done) { return progress(static_cast<int>(done / (total / 100 + 1))); });
 }
 
 int cloneLunData(const LunRow &lun, int from, int to, const CopyProgress &progress)

@@ -3,6 +3,7 @@
 
 #include "host/storage/LunStore.h"
 
+#include <cstdint>
 #include <functional>
 
 namespace norvhost {
@@ -17,6 +18,16 @@ using CopyProgress = std::function<int(int percent)>;
 
 /// The same by copying what is not a hole.
 int copySparsely(int from, int to, const CopyProgress &progress);
+
+/// Bytes of a file that are not in holes.
+int countData(int fd, uint64_t &bytes);
+
+/// Hears how many bytes were copied; a code other than 0 ends the copy.
+using BytesProgress = std::function<int(uint64_t done)>;
+
+/// Copies what is not a hole to the same places of a file that has its size and nothing but zeros yet; what it has
+/// allocated stays so. Little is left for the fsync() that follows: the disk writes along.
+int copyData(int from, int to, const BytesProgress &progress);
 
 /// shareBlocks() between a LUN's data and a file of the same volume, in either direction, or copySparsely() where that
 /// cannot be; then it is refused while initiators may use the LUN, with NORV_ERR_LUN_MAPPED and nothing changed.

@@ -6,6 +6,7 @@
 #include "host/storage/MapFile.h"
 #include "host/storage/Restore.h"
 #include "host/storage/Sweep.h"
+#include "host/storage/Transfers.h"
 #include "platform/error.h"
 
 #include <bitset>
@@ -61,6 +62,8 @@ int lockLun(int lid, int action, LunLock &lock, LunRow &row)
         return err;
     // A failure here is no reason to refuse what can be done all the same.
     if (lock.foundUnfinished() && sweepLun(lid) != 0)
+        syslog(LOG_WARNING, "left to the next sweep: %s", lastError());
+    if (sweepTransfers() != 0)
         syslog(LOG_WARNING, "left to the next sweep: %s", lastError());
     if (requireWhole(row, lock) != 0)
         syslog(LOG_ERR, "LUN %d: an interrupted restore is not completed yet: %s", lid, lastError());

@@ -1,5 +1,7 @@
 #include "host/storage/MapFile.h"
 
+#include "host/state/Fields.h"
+
 #include <charconv>
 
 namespace norvhost {
@@ -42,6 +44,13 @@ std::string mapFileFolder(const _tag_iscsi_lun_ &lun)
 std::string dataPath(const _tag_iscsi_lun_ &lun)
 {
     return isBlock(lun.type) ? std::string(lun.location) : mapFileFolder(lun) + "/" + mapFileName(lun);
+}
+
+std::string importPath(const _tag_iscsi_lun_ &lun)
+{
+    _tag_iscsi_lun_ import = lun;
+    copyText(import.name, "#import"); // '#' is not allowed in names
+    return dataPath(import);
 }
 
 bool parseMapFileName(std::string_view file_name, int &lid)

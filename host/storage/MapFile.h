@@ -54,6 +54,9 @@ std::string mapFileFolder(const _tag_iscsi_lun_ &lun);
 /// The file with the LUN's data, or the device itself for a BLOCK LUN.
 std::string dataPath(const _tag_iscsi_lun_ &lun);
 
+/// Where an import makes the LUN's new file, before it takes the place of the old one. No LUN can have this name.
+std::string importPath(const _tag_iscsi_lun_ &lun);
+
 /// Whether this is a map file's name, and of which LUN ID.
 bool parseMapFileName(std::string_view file_name, int &lid);
 

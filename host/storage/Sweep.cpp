@@ -8,6 +8,7 @@
 #include "host/storage/Restore.h"
 #include "host/storage/SnapshotFiles.h"
 #include "host/storage/SnapshotStore.h"
+#include "host/storage/Transfers.h"
 #include "host/storage/Volumes.h"
 #include "platform/error.h"
 
@@ -133,7 +134,7 @@ int judgeMapFile(const Found &file, const std::string &our_store, Verdict &verdi
     err = loadLunByUuid(mark.uuid, row);
     if (err && err != NORV_ERR_NO_SUCH_LUN)
         return err;
-    if (err) {
+    if (err || file.path == importPath(row.record)) {
         verdict = Verdict::remove;
         return 0;
     }
@@ -197,6 +198,8 @@ int sweepVolumes(SweepResult &result)
         if (sweepOne(found, our_store, result) != 0)
             result.failed.push_back(lastError());
     }
+    if (sweepTransfers() != 0)
+        result.failed.push_back(lastError());
     return mendRestores();
 }
 
