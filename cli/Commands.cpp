@@ -7,8 +7,9 @@ namespace cli {
 namespace {
 
 constexpr char FOOTER[] = "A LUN is selected by its name, its UUID or its place in the list (lun#1), a\n"
-                          "target by its name, its ID or its place in the list (tg#1). Sizes are bytes, or\n"
-                          "take a binary unit: 512M, 1.5G, 10T.\n"
+                          "target by its name, its ID or its place in the list (tg#1), a snapshot by the\n"
+                          "names of its LUN and its own (vm1_nightly), its UUID or its place in the list\n"
+                          "(sn#1). Sizes are bytes, or take a binary unit: 512M, 1.5G, 10T.\n"
                           "Exit status: 0 done, 1 failed, 2 wrong arguments.";
 
 /// Help without the lists of options that need or exclude each other; the parser tells when it matters.
@@ -37,6 +38,9 @@ std::unique_ptr<Commands> makeCommands()
     app.formatter(std::make_shared<HelpFormatter>());
     app.require_subcommand(1);
     addLunVerbs(*commands);
+    addSnapshotVerbs(*commands);
+    addTransferVerbs(*commands);
+    addUpkeepVerbs(*commands);
     addTargetVerbs(*commands);
 
     CLI::App &completion = addNoun(*commands, "completion", "Print a script that completes words for a shell");
@@ -91,6 +95,12 @@ CLI::Option &addSize(CLI::App &verb, const char *flags, Json::Value &input, cons
     return *verb.add_option_function<std::string>(flags, set, description)->type_name("SIZE");
 }
 
+CLI::Option &addNumber(CLI::App &verb, const char *flags, Json::Value &input, const char *key, const char *description)
+{
+    const auto set = [&input, key](const unsigned &number) { input[key] = number; };
+    return *verb.add_option_function<unsigned>(flags, set, description)->type_name("NUMBER");
+}
+
 void addFlag(CLI::App &verb, const char *flags, Json::Value &input, const char *key, const char *description)
 {
     verb.add_flag_callback(
@@ -105,6 +115,11 @@ void addJson(CLI::App &verb, bool &json)
 void addYes(CLI::App &verb, bool &yes)
 {
     verb.add_flag("-y,--yes", yes, "Do not ask");
+}
+
+void addWatch(CLI::App &verb, bool &watch)
+{
+    verb.add_flag("--watch", watch, "Show how far it is until it has ended; Ctrl-C ends the watching only");
 }
 
 std::vector<const CLI::Option *> shownOptions(const CLI::App &verb)

@@ -1,7 +1,7 @@
 /// The definitions of nouns, verbs and options: what is parsed, helped with, completed and documented.
 ///
-/// The type name of an option, and the name of a positional argument, says what can stand there: LUN
-/// and TARGET are selectors, FILE and DIR paths, words between '|' the only ones allowed.
+/// The type name of an option, and the name of a positional argument, says what can stand there: LUN,
+/// SNAPSHOT and TARGET are selectors, FILE and DIR paths, words between '|' the only ones allowed.
 #pragma once
 
 #include <CLI/CLI.hpp>
@@ -22,6 +22,9 @@ std::unique_ptr<Commands> makeCommands();
 
 void addLunVerbs(Commands &commands);
 void addTargetVerbs(Commands &commands);
+void addSnapshotVerbs(Commands &commands);
+void addTransferVerbs(Commands &commands); ///< of the nouns "lun" and "snapshot", which exist
+void addUpkeepVerbs(Commands &commands);
 
 /// What most verbs take.
 struct Arguments {
@@ -29,6 +32,7 @@ struct Arguments {
     Json::Value input{Json::objectValue}; ///< of the request
     bool json = false;
     bool yes = false;
+    bool watch = false;
 };
 
 CLI::App &addNoun(Commands &commands, const char *name, const char *description);
@@ -45,11 +49,13 @@ CLI::Option &addPositionals(CLI::App &verb, const char *name, std::vector<std::s
 // Options that fill one key of the request's input.
 CLI::Option &addText(CLI::App &verb, const char *flags, const char *type, Json::Value &input, const char *key,
                      const char *description);
+CLI::Option &addNumber(CLI::App &verb, const char *flags, Json::Value &input, const char *key, const char *description);
 CLI::Option &addSize(CLI::App &verb, const char *flags, Json::Value &input, const char *key, const char *description);
 void addFlag(CLI::App &verb, const char *flags, Json::Value &input, const char *key, const char *description);
 
 void addJson(CLI::App &verb, bool &json);
 void addYes(CLI::App &verb, bool &yes);
+void addWatch(CLI::App &verb, bool &watch);
 
 /// The options and positional arguments of a verb that are shown to people.
 std::vector<const CLI::Option *> shownOptions(const CLI::App &verb);

@@ -56,6 +56,17 @@ void addNames(Words &found, const char *path)
         found.push_back(object["name"].asString());
 }
 
+/// A snapshot's name is that of its LUN up to the first underscore, and its own up to the first blank.
+void addSnapshotNames(Words &found)
+{
+    for (const Json::Value &snapshot : request(webapi::Method::Get, "/snapshots")) {
+        const std::string lun = snapshot["lun_name"].asString();
+        const std::string name = snapshot["name"].asString();
+        const bool has_name = lun.find('_') == std::string::npos && name.find(' ') == std::string::npos;
+        found.push_back(has_name ? lun + "_" + name : snapshot["uuid"].asString());
+    }
+}
+
 Words candidatesOf(const CLI::Option &option)
 {
     const std::string kind = argumentKind(option);
@@ -64,8 +75,12 @@ Words candidatesOf(const CLI::Option &option)
         addNames(found, "/luns");
     else if (kind == "TARGET")
         addNames(found, "/targets");
+    else if (kind == "SNAPSHOT")
+        addSnapshotNames(found);
     else if (kind == "FILE" || kind == "DIR")
         found.push_back(":" + kind);
+    else if (kind == "DIRECTORY")
+        found.push_back(":DIR");
     else if (kind.find('|') != std::string::npos && kind.find('=') == std::string::npos)
         found = CLI::detail::split(kind, '|');
     return found;

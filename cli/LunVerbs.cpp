@@ -2,9 +2,7 @@
 
 #include "cli/Display.h"
 #include "cli/Request.h"
-#include "cli/Size.h"
-
-#include <ctime>
+#include "cli/Values.h"
 
 namespace cli {
 
@@ -41,31 +39,6 @@ std::string typeName(const Json::Value &number)
             return known.name;
     }
     return number.asString();
-}
-
-std::string sizeText(const Json::Value &bytes)
-{
-    return bytes.isNull() ? "unknown" : shownSize(bytes.asUInt64());
-}
-
-std::string exactSizeText(const Json::Value &bytes)
-{
-    return bytes.isNull() ? "unknown" : sizeText(bytes) + " (" + bytes.asString() + " bytes)";
-}
-
-std::string yesNo(const Json::Value &value)
-{
-    return value.asBool() ? "yes" : "no";
-}
-
-std::string timeText(const Json::Value &seconds)
-{
-    const auto time = static_cast<time_t>(seconds.asInt64());
-    tm local{};
-    char text[64];
-    if (time == 0 || !localtime_r(&time, &local))
-        return "never";
-    return std::string(text, strftime(text, sizeof(text), "%Y-%m-%d %H:%M:%S %Z", &local));
 }
 
 /// One line on what became of the LUN, or its JSON form.
@@ -188,6 +161,7 @@ void addShow(Commands &commands, CLI::App &noun)
         if (a->json)
             return printJson(lun);
         printLunDetails(lun);
+        printTransfer("Import", lunPath(lun["uuid"].asString(), "/import"));
     });
     addSelector(verb, *a);
     addJson(verb, a->json);

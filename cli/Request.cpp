@@ -28,6 +28,11 @@ std::string targetPath(const std::string &selector, const std::string &rest)
     return "/targets/" + webapi::pathSegment(selector) + rest;
 }
 
+std::string snapshotPath(const std::string &selector, const std::string &rest)
+{
+    return "/snapshots/" + webapi::pathSegment(selector) + rest;
+}
+
 void print(const std::string &text)
 {
     if (fwrite(text.data(), 1, text.size(), stdout) != text.size() || fflush(stdout) != 0)

@@ -24,13 +24,17 @@ struct UsageError {
 Json::Value request(webapi::Method method, const std::string &path,
                     const Json::Value &input = Json::Value(Json::objectValue));
 
-/// "/luns/NAME" and "/targets/NAME", with what follows.
+/// "/luns/NAME", "/targets/NAME" and "/snapshots/NAME", with what follows.
 std::string lunPath(const std::string &selector, const std::string &rest = "");
 std::string targetPath(const std::string &selector, const std::string &rest = "");
+std::string snapshotPath(const std::string &selector, const std::string &rest = "");
 
 /// Writes to standard output; throws Failure when that fails.
 void print(const std::string &text);
 void printJson(const Json::Value &value);
+
+/// Prints how far an export or import is, if one runs, as the handlers tell it under this path.
+void printTransfer(const char *kind, const std::string &path);
 
 /// Throws UsageError unless there is a terminal to confirm something at.
 void requireTerminal();

@@ -60,6 +60,26 @@ const char *hint(int code)
         return "'iscsictl lun show' tells to which targets, 'iscsictl lun unmap' removes it from them";
     case ISCSI::ERR_BAD_LUN_LOCATION:
         return "'iscsi-host volume list' shows the volumes, 'iscsi-host volume add' adds one";
+    case ISCSI::ERR_BAD_SNAPSHOT_UUID:
+    case ISCSI::ERR_NO_SUCH_SNAPSHOT:
+        return "'iscsictl snapshot list' shows the snapshots; of a LUN whose name has an underscore, take the UUID";
+    case ISCSI::ERR_LUN_IS_LOCKED:
+        return "'iscsictl lun show' tells what is done with it; try again when that has ended";
+    case ISCSI::ERR_SNAPSHOT_IS_LOCKED:
+        return "'iscsictl snapshot show' tells who locks it, 'iscsictl snapshot unlock --app-key' takes a key's lock "
+               "back";
+    case ISCSI::ERR_CANNOT_DELETE_LOCKED_SNAPSHOT:
+        return "'iscsictl snapshot unlock' lets it be deleted";
+    case ISCSI::ERR_REACH_MAX_SNAPSHOT_COUNT:
+        return "'iscsictl snapshot delete' makes room, 'iscsictl retention set' keeps it";
+    case ISCSI::ERR_BAD_EXPORTING_LOCATION:
+        return "the directory's path has to be absolute and outside of where LUNs and snapshots lie";
+    case ISCSI::ERR_NOW_IS_NOT_EXPORTING:
+    case ISCSI::ERR_EXPORT_INTERRUPT:
+        return "'iscsictl snapshot show' tells whether it is exported";
+    case ISCSI::ERR_NOW_IS_NOT_IMPORTING:
+    case ISCSI::ERR_IMPORT_INTERRUPT:
+        return "'iscsictl lun show' tells whether something is imported into it";
     case ISCSI::ERR_FAILED_TO_START_SERVICE:
         return "'iscsi-host boot' starts the iSCSI service";
     default:

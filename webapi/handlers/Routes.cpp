@@ -26,7 +26,7 @@ constexpr uint64_t ACTOR_MAX_BYTES = 31;
 constexpr uint64_t APP_KEY_MAX_BYTES = 127;
 constexpr uint64_t RULE_MAX_BYTES = 255;
 constexpr uint64_t EVENTS_MAX = 10000; // as many as are kept
-constexpr uint64_t MAX_MASKS = 1024; // bounds the work of one request
+constexpr uint64_t MAX_MASKS = 1024;   // bounds the work of one request
 
 constexpr Field LUN_LIST[] = {
     {"status", Type::Boolean, OPTIONAL, 0, 0, 0},
