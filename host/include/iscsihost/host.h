@@ -61,10 +61,10 @@ ISCSI_HOST_API int supervise();
 /// Stops the daemons. Sessions end; the state stays.
 ISCSI_HOST_API int stop();
 
-/// The address that initiators connect to; "all" for every address of the machine. Takes effect when the daemons
-/// start.
-ISCSI_HOST_API int setPortal(const std::string &address);
-ISCSI_HOST_API int getPortal(std::string &address);
+/// The IP addresses that initiators connect to, with spaces between them; "all" for every address of the machine.
+/// Takes effect when the daemons start.
+ISCSI_HOST_API int setPortal(const std::string &addresses);
+ISCSI_HOST_API int getPortal(std::string &addresses);
 
 struct UnhealthyLun {
     int lid;
