@@ -100,8 +100,7 @@ void LunLock::tell(int percent)
     char text[32];
     const int length = snprintf(text, sizeof text, "%3d %4d\n", action_state, percent);
     // Display only: an action does not fail because its progress cannot be told.
-    if (pwrite(file.get(), text, static_cast<size_t>(length), 0) != length)
-        fail(NORV_ERR_WRITE_FILE, "cannot write an action's progress");
+    (void)!pwrite(file.get(), text, static_cast<size_t>(length), 0);
 }
 
 void LunLock::become(int state)

@@ -53,6 +53,26 @@ struct VolumeTestNeedsRoot : VolumeTest {
         if (geteuid() == 0 && !isUnmounted())
             run({"umount", xfs});
     }
+    /// Leaves no block for data and none for another file.
+    void fill()
+    {
+        const int fd = open((xfs + "/fill").c_str(), O_CREAT | O_WRONLY, 0600);
+        ASSERT_LE(0, fd);
+        off_t at = 0;
+        for (off_t length = off_t(MiB); length >= 4096;) {
+            if (fallocate(fd, 0, at, length) == 0)
+                at += length;
+            else
+                length /= 2;
+        }
+        close(fd);
+        for (int i = 0;; ++i) {
+            const int file = open((xfs + "/inode" + std::to_string(i)).c_str(), O_CREAT | O_WRONLY | O_EXCL, 0600);
+            if (file < 0)
+                break;
+            close(file);
+        }
+    }
     bool isUnmounted()
     {
         VolumeRow row;
@@ -137,21 +157,7 @@ TEST_F(VolumeTestNeedsRoot, AFullDiskRefusesAndKeepsNothing)
     EXPECT_EQ(NORV_ERR_OUT_OF_SPACE, NORViSCSILunCreate(&more));
     EXPECT_EQ(NORV_ERR_OUT_OF_SPACE, update(lun, "b", 1024 * MiB));
 
-    // Not a block left, so that the allocation itself and the making of a file fail.
-    const int fd = open((xfs + "/fill").c_str(), O_CREAT | O_WRONLY, 0600);
-    ASSERT_LE(0, fd);
-    for (off_t at = 0, length = off_t(MiB); length >= 4096;) {
-        if (fallocate(fd, 0, at, length) == 0)
-            at += length;
-        else
-            length /= 2;
-    }
-    for (int i = 0; i < 100000; ++i) {
-        const int file = open((xfs + "/inode" + std::to_string(i)).c_str(), O_CREAT | O_WRONLY | O_EXCL, 0600);
-        if (file < 0)
-            break;
-        close(file);
-    }
+    fill();
     more = wanted("more", NORV_LUN_TYPE_FILE, 2 * MiB);
     EXPECT_EQ(NORV_ERR_OUT_OF_SPACE, NORViSCSILunCreate(&more)) << iscsi_host_last_error();
     more = wanted("thin");
@@ -159,12 +165,38 @@ TEST_F(VolumeTestNeedsRoot, AFullDiskRefusesAndKeepsNothing)
     EXPECT_EQ(NORV_ERR_OUT_OF_SPACE, update(lun, "b", 101 * MiB));
     EXPECT_STREQ("a", reload(lun).name);
     expectConsistent();
-    close(fd);
 
     _tag_iscsi_lun_ gone = lun;
     EXPECT_EQ(0, NORViSCSILunDelete(&gone)) << "a full disk can be emptied: " << iscsi_host_last_error();
     create("after", NORV_LUN_TYPE_FILE, 90 * MiB);
     expectConsistent();
+}
+
+TEST_F(VolumeTestNeedsRoot, AFullStateRefusesAndKeepsNothing)
+{
+    // The state alone lies on the full file system.
+    volume = root + "/vol";
+    setenv("ISCSI_HOST_STATE", (xfs + "/state").c_str(), 1);
+    closeDatabase();
+    ASSERT_EQ(0, iscsihost::addVolume(volume)) << iscsi_host_last_error();
+    const _tag_iscsi_lun_ lun = create("a");
+    fill();
+
+    int made = 0, err = 0;
+    for (; made < 1000 && !err; ++made) {
+        _tag_iscsi_lun_ more = wanted("more" + std::to_string(made));
+        err = NORViSCSILunCreate(&more);
+    }
+    EXPECT_EQ(NORV_ERR_OUT_OF_SPACE, err) << iscsi_host_last_error();
+    expectConsistent();
+    EXPECT_EQ(NORV_ERR_OUT_OF_SPACE, update(lun, std::string(150, 'b'), 8 * MiB)) << iscsi_host_last_error();
+    EXPECT_STREQ("a", reload(lun).name);
+    expectConsistent();
+
+    ASSERT_EQ(0, unlink((xfs + "/fill").c_str()));
+    create("after");
+    expectConsistent();
+    closeDatabase();
 }
 
 TEST_F(VolumeTestNeedsRoot, AReadOnlyVolumeRefusesAndChangesNothing)
