@@ -245,7 +245,7 @@ int reopenUnit(const Tgtd &daemon, const _tag_iscsi_target_ &target, uint64_t lu
     TgtdConnection ours;
     if (int err = findConnection(daemon, target.tid, initiator, ours))
         return err;
-    size_t pings;
+    size_t pings = 0;
     if (int err = stopQueue(session, lun, pings))
         return err;
     if (int err = waitForIdle(daemon, ours, target.tid, lun, pings))

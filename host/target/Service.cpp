@@ -40,7 +40,7 @@ using namespace std::chrono_literals;
 
 constexpr auto start_limit = 10s;
 constexpr auto stop_limit = 5s;
-constexpr auto supervise_interval = 5s;
+constexpr auto supervise_interval = 5s, retry_interval = 1s;
 
 constexpr const char *tgtd_program = "/usr/sbin/tgtd";
 
@@ -179,7 +179,7 @@ int startTgtd(const Tgtd &daemon)
 
     const std::string name = std::string("tgtd-") + daemon.name();
     pid_t pid;
-    if (int err = spawnDaemon(name, {tgtd_program, "-D", "-t", tgtd_threads, "--iscsi", option},
+    if (int err = spawnDaemon(name, {tgtd_program, "-f", "-t", tgtd_threads, "--iscsi", option},
                               "TGT_IPC_SOCKET=" + daemon.socketVariable(), pid))
         return err;
     bool ended = false, serves = false;
@@ -262,7 +262,8 @@ bool waitForEvent(int signals)
     std::vector<pollfd> events = {{signals, POLLIN, 0}};
     for (const FileDescriptor &process : processes)
         events.push_back({process.get(), POLLIN, 0});
-    poll(events.data(), events.size(), static_cast<int>(std::chrono::milliseconds(supervise_interval).count()));
+    const std::chrono::milliseconds interval = processes.size() == 3 ? supervise_interval : retry_interval;
+    poll(events.data(), events.size(), static_cast<int>(interval.count()));
     return events[0].revents != 0;
 }
 
@@ -315,10 +316,10 @@ int superviseService()
     if (int err = startService())
         return err;
     do {
-        while (waitpid(-1, nullptr, WNOHANG) > 0)
-            ;
         if (int err = startMissing())
             syslog(LOG_ERR, "the iSCSI service is not complete (%d): %s", err, lastError());
+        while (waitpid(-1, nullptr, WNOHANG) > 0)
+            ;
     } while (!waitForEvent(stop.get()));
     return stopService();
 }

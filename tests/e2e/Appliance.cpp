@@ -28,10 +28,15 @@ Appliance::Appliance()
     char folder[] = "/tmp/e2e-XXXXXX";
     root = mkdtemp(folder);
     setenv("ISCSI_HOST_STATE", (root + "/state").c_str(), 1);
+    setenv("ISCSI_HOST_PORTALD", PORTALD_PATH, 1);
     setenv("ISCSI_HOST_RUN", (root + "/run").c_str(), 1);
     std::filesystem::create_directory(root + "/volume");
     EXPECT_EQ(iscsihost::addVolume(root + "/volume"), 0) << iscsi_host_last_error();
-    EXPECT_EQ(norvhost::startService(), 0) << iscsi_host_last_error();
+}
+
+void Appliance::SetUp()
+{
+    ASSERT_EQ(norvhost::startService(), 0) << iscsi_host_last_error();
 }
 
 Appliance::~Appliance()
@@ -184,13 +189,19 @@ int runTestsIsolated()
 
 } // namespace
 
+/// libiscsi 1.19 loses a few bytes when a connection breaks under one of its blocking calls.
+extern "C" const char *__lsan_default_suppressions()
+{
+    return "leak:libiscsi.so";
+}
+
 int main(int argc, char **argv)
 {
     const bool only_lists = argc > 1 && strstr(argv[1], "--gtest_list_tests");
     testing::InitGoogleTest(&argc, argv);
     if (only_lists)
         return RUN_ALL_TESTS();
-    if (unshare(CLONE_NEWNET | CLONE_NEWNS | CLONE_NEWPID) != 0) {
+    if (unshare(CLONE_NEWNET | CLONE_NEWNS | CLONE_NEWPID | CLONE_NEWIPC) != 0) {
         perror("these tests make namespaces, run them as root");
         return 1;
     }

@@ -24,6 +24,7 @@ class Appliance : public testing::Test {
 protected:
     Appliance();
     ~Appliance() override;
+    void SetUp() override;
 
     std::string root; ///< the temporary folder with state, run folder and volume
 
