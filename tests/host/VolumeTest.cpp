@@ -93,11 +93,13 @@ TEST_F(VolumeTest, RegistersCanonicalFolders)
     EXPECT_EQ(NORV_ERR_LUN_LOCATION, iscsihost::addVolume(""));
     EXPECT_EQ(NORV_ERR_BAD_FILE_SYSTEM_TYPE, iscsihost::addVolume("/proc")) << iscsi_host_last_error();
 
-    const std::string deep = root + "/" + std::string(250, 'd'), odd = root + "/a\nb";
+    const std::string deep = root + "/" + std::string(250, 'd');
     std::filesystem::create_directories(deep + "/" + std::string(100, 'd'));
-    std::filesystem::create_directory(odd);
     EXPECT_EQ(NORV_ERR_LUN_LOCATION, iscsihost::addVolume(deep + "/" + std::string(100, 'd')));
-    EXPECT_EQ(NORV_ERR_LUN_LOCATION, iscsihost::addVolume(odd));
+    for (const char *odd : {"/a\nb", "/a*b", "/[a]", "/a\\b"}) {
+        std::filesystem::create_directory(root + odd);
+        EXPECT_EQ(NORV_ERR_LUN_LOCATION, iscsihost::addVolume(root + odd));
+    }
 
     const iscsihost::Volume listed = only(volume);
     EXPECT_TRUE(listed.mounted);
@@ -122,6 +124,8 @@ TEST_F(VolumeTest, CreateRefusesWhatItWouldHarm)
     std::string text;
     std::getline(std::ifstream(image), text);
     EXPECT_EQ("somebody's", text);
+    EXPECT_FALSE(exists(folder));
+    EXPECT_EQ(NORV_ERR_FILE_EXISTS, iscsihost::createVolume(root, 300 * MiB, root + "/other"));
     for (uint64_t size : {uint64_t(0), 299 * MiB, 300 * MiB + 1, UINT64_MAX})
         EXPECT_EQ(NORV_ERR_LUN_SIZE, iscsihost::createVolume(folder, size, root + "/other"));
     EXPECT_FALSE(exists(root + "/other"));
