@@ -30,6 +30,7 @@ std::string targetPath(const std::string &selector, const std::string &rest = ""
 
 /// Writes to standard output; throws Failure when that fails.
 void print(const std::string &text);
+/// A list takes a line for each element.
 void printJson(const Json::Value &value);
 
 /// Throws UsageError unless there is a terminal to confirm something at.
