@@ -188,7 +188,7 @@ int createInFolder(const std::string &folder, uint64_t size, const std::string &
 
 int checkNoLuns(const std::string &path)
 {
-    int luns;
+    int luns = 0;
     if (int err = countLuns(path, luns))
         return err;
     return luns == 0 ? 0 : fail(NORV_ERR_REMOVE_CONFIG, "%d LUN(s) live on %s: delete them first", luns, path.c_str());

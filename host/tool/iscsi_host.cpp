@@ -194,9 +194,7 @@ int showStatus(bool as_json)
     return exit_ok;
 }
 
-} // namespace
-
-int main(int argc, char **argv)
+int runTool(int argc, char **argv)
 {
     CLI::App app("Volumes and the iSCSI service of this machine.", "iscsi-host");
     app.require_subcommand(1);
@@ -252,4 +250,16 @@ int main(int argc, char **argv)
         return app.exit(error) == 0 ? exit_ok : exit_usage;
     }
     return status;
+}
+
+} // namespace
+
+int main(int argc, char **argv)
+{
+    try {
+        return runTool(argc, argv);
+    } catch (const std::exception &error) {
+        fprintf(stderr, "iscsi-host: %s\n", error.what());
+        return exit_failed;
+    }
 }
