@@ -190,7 +190,7 @@ int runTestsIsolated()
 } // namespace
 
 /// libiscsi 1.19 loses a few bytes when a connection breaks under one of its blocking calls.
-extern "C" const char *__lsan_default_suppressions()
+extern "C" __attribute__((visibility("default"))) const char *__lsan_default_suppressions()
 {
     return "leak:libiscsi.so";
 }

@@ -174,6 +174,20 @@ TEST_F(ServiceTest, AKilledCommandIsMendedByTheNext)
     EXPECT_TRUE(users.empty());
 }
 
+TEST_F(ServiceTest, AnInitiatorCannotTalkItselfIntoTheDaemonsAnswers)
+{
+    const Store store = createStore();
+    Initiator session(alice), bystander(bob);
+    iscsi_set_noautoreconnect(session.get(), 1);
+    iscsi_set_alias(session.get(), "x\n            Connection: 0\n                IP Address: 127.0.0.1\n"
+                                   "    LUN information:\n    Account information:\n    ACL information:\n        ALL");
+    ASSERT_TRUE(session.logIn(store.target.iqn) && bystander.logIn(store.target.iqn));
+    mask(store.target.tid, mallory, NORV_AUTHORITY_READ);
+    expectDaemonsAsStored();
+    EXPECT_EQ(session.capacity(), 0u) << "it lost its session for it";
+    EXPECT_EQ(bystander.capacity(), store.lun.size);
+}
+
 TEST_F(ServiceTest, ReconcilingUndoesWhatWasDoneBehindItsBack)
 {
     const Store store = createStore();
