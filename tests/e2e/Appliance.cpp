@@ -51,8 +51,8 @@ _tag_iscsi_lun_ Appliance::createLun(const std::string &name, uint64_t size, int
     _tag_iscsi_lun_ lun = {};
     lun.type = type;
     lun.size = size;
-    name.copy(lun.name, sizeof lun.name - 1);
-    strcpy(lun.location, (std::filesystem::path(getenv("ISCSI_HOST_STATE")).parent_path() / "volume").c_str());
+    setText(lun.name, name);
+    setText(lun.location, std::filesystem::path(getenv("ISCSI_HOST_STATE")).parent_path() / "volume");
     EXPECT_EQ(NORViSCSILunCreate(&lun), 0) << iscsi_host_last_error();
     return lun;
 }
@@ -65,8 +65,8 @@ std::string Appliance::iqn(const std::string &name)
 _tag_iscsi_target_ Appliance::request(const std::string &name)
 {
     _tag_iscsi_target_ target = {};
-    name.copy(target.name, sizeof target.name - 1);
-    iqn(name).copy(target.iqn, sizeof target.iqn - 1);
+    setText(target.name, name);
+    setText(target.iqn, iqn(name));
     target.enabled = 1;
     return target;
 }
@@ -95,7 +95,7 @@ std::vector<_tag_struct_iscsi_acl_> entry(int tid, const std::string &initiator,
 {
     _tag_struct_iscsi_acl_ entry = {};
     entry.tid = tid;
-    initiator.copy(entry.iqn, sizeof entry.iqn - 1);
+    setText(entry.iqn, initiator);
     entry.permission = permission;
     return {entry};
 }

@@ -56,7 +56,7 @@ private:
             flush
         } action = write;
         uint32_t stamp = 0; ///< what its blocks hold, 0 = never written
-        std::vector<uint32_t> data = std::vector<uint32_t>(request_blocks * block_size / sizeof(uint32_t));
+        std::vector<uint32_t> data = std::vector<uint32_t>(size_t{request_blocks} * block_size / sizeof(uint32_t));
     };
 
     void failed(const std::string &what)

@@ -107,7 +107,7 @@ TEST_F(MaskingTest, LetterCaseOfANameDoesNotMatter)
     EXPECT_EQ(NORViSCSITargetMaskingGet(store.target.tid, entries), 0);
     EXPECT_EQ(entries[0].iqn, iqn("Carol"));
     other[0] = entries[0];
-    strcpy(other[0].iqn, iqn("carol").c_str());
+    setText(other[0].iqn, iqn("carol"));
     EXPECT_EQ(NORViSCSIMaskingsCreate(other), NORV_ERR_TARGET_ACL);
     EXPECT_EQ(NORViSCSIMaskingsRemove(other), 0);
 }

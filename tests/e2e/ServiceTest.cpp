@@ -32,6 +32,10 @@ protected:
             std::vector<norvhost::TgtdTarget> shown_targets;
             ASSERT_EQ(daemon.showTargets(shown_targets), 0) << iscsi_host_last_error();
             std::set<std::string> wanted, found;
+            const auto add = [](std::set<std::string> &facts, int tid, const std::string &what,
+                                const std::string &name) {
+                facts.insert("target " + std::to_string(tid) + " " + what + " " + name);
+            };
             for (const _tag_iscsi_target_ &target : stored) {
                 norvhost::Masking masking;
                 std::vector<norvhost::MappedLun> luns;
@@ -39,25 +43,23 @@ protected:
                 ASSERT_EQ(norvhost::loadMappedLuns(target.tid, luns), 0);
                 if (permission == NORV_AUTHORITY_READ && !masking.gives(permission))
                     continue;
-                const std::string prefix = std::to_string(target.tid) + " ";
-                wanted.insert(prefix + target.iqn + (target.enabled ? " ready" : " offline"));
+                add(wanted, target.tid, target.enabled ? "ready" : "offline", target.iqn);
                 for (const auto &lun : luns)
-                    wanted.insert(prefix + "unit " + std::to_string(lun.index) + " " + lun.uuid);
+                    add(wanted, target.tid, "unit " + std::to_string(lun.index), lun.uuid);
                 for (const auto &[name, given] : masking.named)
                     if (given == permission && target.enabled)
-                        wanted.insert(prefix + "name " + name);
+                        add(wanted, target.tid, "name", name);
                 if (target.auth_type)
-                    wanted.insert(prefix + "user " + target.user);
+                    add(wanted, target.tid, "user", target.user);
             }
             for (const norvhost::TgtdTarget &target : shown_targets) {
-                const std::string prefix = std::to_string(target.tid) + " ";
-                found.insert(prefix + target.iqn + (target.ready ? " ready" : " offline"));
+                add(found, target.tid, target.ready ? "ready" : "offline", target.iqn);
                 for (const auto &unit : target.units)
-                    found.insert(prefix + "unit " + std::to_string(unit.lun) + " " + unit.serial);
+                    add(found, target.tid, "unit " + std::to_string(unit.lun), unit.serial);
                 for (const std::string &name : target.names)
-                    found.insert(prefix + "name " + name);
+                    add(found, target.tid, "name", name);
                 for (const std::string &user : target.users)
-                    found.insert(prefix + "user " + user);
+                    add(found, target.tid, "user", user);
             }
             EXPECT_EQ(found, wanted) << daemon.name();
         }
@@ -141,8 +143,8 @@ TEST_F(ServiceTest, AKilledCommandIsMendedByTheNext)
             for (int i = 0;; ++i) {
                 _tag_iscsi_target_ target = request("t" + std::to_string(round) + "-" + std::to_string(i));
                 target.auth_type = NORV_TARGET_AUTH_CHAP;
-                strcpy(target.user, ("user" + std::to_string(random() % 4)).c_str());
-                strcpy(target.password, "secret-of-a-user");
+                setText(target.user, "user" + std::to_string(random() % 4));
+                setText(target.password, "secret-of-a-user");
                 if (NORViSCSITargetCreate(&target))
                     return 1;
                 map(lun, {target.tid});
