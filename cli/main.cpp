@@ -5,6 +5,7 @@
 #include "iscsiwebapi/ISCSIErrorCode.h"
 
 #include <cstdio>
+#include <unistd.h>
 
 namespace {
 
@@ -60,10 +61,8 @@ const char *hint(int code)
         return "'iscsictl lun show' tells to which targets, 'iscsictl lun unmap' removes it from them";
     case ISCSI::ERR_BAD_LUN_LOCATION:
         return "'iscsi-host volume list' shows the volumes, 'iscsi-host volume add' adds one";
-    case ISCSI::ERR_FAILED_TO_START_SERVICE:
-        return "'iscsi-host boot' starts the iSCSI service";
     default:
-        return nullptr;
+        return geteuid() == 0 ? nullptr : "the appliance's state is usually root's alone";
     }
 }
 
