@@ -205,6 +205,7 @@ int main(int argc, char **argv)
         perror("these tests make namespaces, run them as root");
         return 1;
     }
+    signal(SIGPIPE, SIG_IGN); // libiscsi does not mind it
     const pid_t first = fork();
     if (first == 0) {
         norvhost::ProgramResult result;

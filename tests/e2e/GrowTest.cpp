@@ -5,11 +5,12 @@
 #include "iscsihost/host.h"
 
 #include <atomic>
-#include <cstring>
+#include <csignal>
 #include <iscsi/scsi-lowlevel.h>
 #include <poll.h>
 #include <random>
 #include <thread>
+#include <unistd.h>
 
 namespace e2e {
 namespace {
@@ -42,7 +43,7 @@ public:
     }
 
     std::atomic<uint64_t> done{0};
-    int failures = 0;
+    std::atomic<int> failures{0};
     std::string first_failure;
 
 private:
@@ -116,7 +117,6 @@ private:
 
     void run()
     {
-        std::vector<Slot> all(slots);
         for (int i = 0; i < slots; ++i) {
             all[static_cast<size_t>(i)].load = this;
             all[static_cast<size_t>(i)].number = i;
@@ -133,10 +133,9 @@ private:
                 break;
             }
         }
-        // Commands under way are told to the slots that live here.
-        iscsi_disconnect(initiator.get());
     }
 
+    std::vector<Slot> all = std::vector<Slot>(slots); ///< outlives the session, which tells them its end
     Initiator initiator;
     bool connected = false;
     std::thread thread;
@@ -173,6 +172,53 @@ TEST_F(GrowTest, AMappedLunGrowsUnderLoad)
     ASSERT_TRUE(after.logIn(second.iqn));
     EXPECT_EQ(after.capacity(), size);
     EXPECT_EQ(shown(rw, store.target.tid).names, std::vector<std::string>{alice}) << "a name of ours was left";
+}
+
+TEST_F(GrowTest, AKilledGrowNeitherFailsNorHoldsUpTheLoad)
+{
+    const Store store = createStore();
+    Load load(alice, store.target.iqn);
+    ASSERT_TRUE(load.isConnected());
+    load.start();
+    std::mt19937 random(3);
+    uint64_t size = store.lun.size;
+    for (int i = 0; i < 15; ++i) {
+        size += 2 * MiB;
+        const pid_t child = inChild([&] { return grow(store.lun, size); });
+        // Not a wait for anything: the moment of the kill is meant to be any.
+        usleep(static_cast<useconds_t>(random() % 120000));
+        kill(child, SIGKILL);
+        waitForChild(child);
+        const uint64_t done = load.done;
+        EXPECT_TRUE(norvhost::waitFor(10s, [&] { return load.done > done + in_flight; })) << "the load stands still";
+        size += 2 * MiB;
+        EXPECT_EQ(grow(store.lun, size), 0) << iscsi_host_last_error();
+    }
+    load.stop();
+    EXPECT_EQ(load.failures, 0) << load.first_failure;
+    Initiator after(alice);
+    ASSERT_TRUE(after.logIn(store.target.iqn));
+    EXPECT_EQ(after.capacity(), size);
+}
+
+TEST_F(GrowTest, ALunUnderLoadCanBeTakenAway)
+{
+    const Store store = createStore();
+    for (const auto &take : std::vector<std::function<int()>>{
+             [&] { return unmap(store.lun, {store.target.tid}); },
+             [&] { return NORViSCSITargetRemove(&store.target); },
+         }) {
+        Load load(alice, store.target.iqn);
+        ASSERT_TRUE(load.isConnected());
+        load.start();
+        EXPECT_TRUE(norvhost::waitFor(10s, [&] { return load.done > 100; }));
+        EXPECT_EQ(take(), 0) << iscsi_host_last_error();
+        EXPECT_TRUE(norvhost::waitFor(10s, [&] { return load.failures > 0; }));
+        load.stop();
+        EXPECT_TRUE(shown(rw, store.target.tid).units.empty());
+        if (shown(rw, store.target.tid).tid)
+            map(store.lun, {store.target.tid});
+    }
 }
 
 } // namespace

@@ -134,6 +134,19 @@ TEST_F(ServiceTest, ASupervisedServiceHealsWhileAnInitiatorWorks)
     EXPECT_EQ(rw.processId() + ro.processId() + portalProcess(), 0) << "nothing is left running";
 }
 
+TEST_F(ServiceTest, WhoIsLetInByDefaultComesBackAfterARestart)
+{
+    const Store store = createStore();
+    mask(store.target.tid, mallory, NORV_AUTHORITY_NONE);
+    setDefault(store.target, NORV_AUTHORITY_READ_WRITE);
+    Initiator session(iqn("guest"));
+    ASSERT_TRUE(session.logIn(store.target.iqn));
+    killProcess(rw.processId());
+    ASSERT_EQ(norvhost::startService(), 0) << iscsi_host_last_error();
+    clearAttention(session.get(), 1);
+    EXPECT_TRUE(session.write(0, 0x5b)) << session.error();
+}
+
 TEST_F(ServiceTest, AKilledCommandIsMendedByTheNext)
 {
     const _tag_iscsi_lun_ lun = createLun("lun");
