@@ -1,5 +1,6 @@
 /// The functions of the public header.
 #include "host/core/LastError.h"
+#include "host/core/Lock.h"
 #include "host/services/Retention.h"
 #include "host/services/Schedules.h"
 #include "host/state/Database.h"
@@ -55,6 +56,16 @@ void note(int err, int &first, std::vector<std::string> &failed)
 } // namespace
 
 namespace iscsihost {
+
+struct MaskingChange::Lock : NamedLock {};
+
+MaskingChange::MaskingChange() : lock(std::make_unique<Lock>()) {}
+MaskingChange::~MaskingChange() = default;
+
+int MaskingChange::begin(int tid)
+{
+    return lock->take("masking-" + std::to_string(tid));
+}
 
 int addVolume(const std::string &folder)
 {

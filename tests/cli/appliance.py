@@ -30,6 +30,9 @@ class Appliance(unittest.TestCase):
         return subprocess.run([ISCSICTL, *args], env=self.env, input=stdin, capture_output=True, text=True,
                               errors="surrogateescape", timeout=60)
 
+    def start(self, *args):
+        return subprocess.Popen([ISCSICTL, *args], env=self.env, stdout=subprocess.DEVNULL)
+
     def ok(self, *args, **kwargs):
         result = self.run_cli(*args, **kwargs)
         self.assertEqual((result.returncode, result.stderr), (0, ""), args)

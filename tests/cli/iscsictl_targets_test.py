@@ -45,6 +45,13 @@ class Targets(Appliance):
         self.ok("target", "delete", "--yes", "7up")
         self.assertEqual([target["name"] for target in json.loads(self.ok("target", "list", "--json"))], ["My Web"])
 
+    def test_changes_of_one_masking_at_once_all_last(self):
+        self.ok("target", "create", "t")
+        names = [f"iqn.2024-05.org.example:{number}" for number in range(12)]
+        commands = [self.start("target", "masks", "t", "--add", name + "=r") for name in names]
+        self.assertEqual([command.wait() for command in commands], [0] * len(names))
+        self.assertEqual(self.masks(), {"default": "rw", **dict.fromkeys(names, "r")})
+
     def test_mapping(self):
         for name in ("one", "two"):
             self.create(name)

@@ -5,6 +5,7 @@
 #pragma once
 
 #include <cstdint>
+#include <memory>
 #include <string>
 #include <vector>
 
@@ -82,6 +83,22 @@ struct Status {
 };
 
 ISCSI_HOST_API int status(Status &status);
+
+/// Held while a target's masking is read, changed and written back, so that two such changes at once both last.
+class ISCSI_HOST_API MaskingChange {
+public:
+    MaskingChange();
+    ~MaskingChange();
+    MaskingChange(const MaskingChange &) = delete;
+    MaskingChange &operator=(const MaskingChange &) = delete;
+
+    /// Waits for other changes of the target's masking to end. The object's end lets the next one go on.
+    int begin(int tid);
+
+private:
+    struct Lock;
+    std::unique_ptr<Lock> lock;
+};
 
 /// Stores a job of a LUN, of the kind "backup" or "snapshot", one of each for a LUN. It goes with its LUN.
 ISCSI_HOST_API int addSchedule(const std::string &kind, int lid, const std::string &rule, int64_t &id);
