@@ -95,8 +95,9 @@ void printList(const Json::Value &luns, bool status)
     if (status) {
         columns.emplace_back("ALLOCATED", Align::Right);
         columns.emplace_back("STATUS", Align::Left);
+        columns.emplace_back("LOCKED", Align::Left);
     }
-    for (const char *title : {"MAPPED", "LOCKED", "LOCATION", "UUID"})
+    for (const char *title : {"MAPPED", "LOCATION", "UUID"})
         columns.emplace_back(title, Align::Left);
     Table table(columns);
     size_t index = 0;
@@ -106,9 +107,9 @@ void printList(const Json::Value &luns, bool status)
         if (status) {
             cells.push_back(sizeText(lun["allocated_size"]));
             cells.push_back(lun["status"].asString());
+            cells.push_back(yesNo(lun["is_action_locked"]));
         }
         cells.push_back(yesNo(lun["is_mapped"]));
-        cells.push_back(yesNo(lun["is_action_locked"]));
         cells.push_back(lun["location"].asString());
         cells.push_back(lun["uuid"].asString());
         table.add(std::move(cells));
@@ -125,7 +126,7 @@ void addList(Commands &commands, CLI::App &noun)
             return printJson(luns);
         printList(luns, a->input["status"].asBool());
     });
-    addFlag(verb, "--status", a->input, "status", "Show status and allocated size too, which takes longer");
+    addFlag(verb, "--status", a->input, "status", "Show status, allocated size and locks too, which takes longer");
     addJson(verb, a->json);
 }
 

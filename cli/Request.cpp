@@ -6,6 +6,9 @@
 
 #include <cerrno>
 #include <cstdio>
+#include <cstring>
+#include <memory>
+#include <sstream>
 #include <unistd.h>
 
 namespace cli {
@@ -41,9 +44,21 @@ void print(const std::string &text)
 
 void printJson(const Json::Value &value)
 {
-    Json::StreamWriterBuilder writer;
-    writer["indentation"] = "  ";
-    print(Json::writeString(writer, value) + "\n");
+    Json::StreamWriterBuilder builder;
+    if (!value.isArray()) {
+        builder["indentation"] = "  ";
+        return print(Json::writeString(builder, value) + "\n");
+    }
+    builder["indentation"] = "";
+    const std::unique_ptr<Json::StreamWriter> writer(builder.newStreamWriter());
+    std::ostringstream text;
+    const char *before = "[\n";
+    for (const Json::Value &element : value) {
+        text << before;
+        writer->write(element, &text);
+        before = ",\n";
+    }
+    print(value.empty() ? "[]\n" : text.str() + "\n]\n");
 }
 
 void requireTerminal()

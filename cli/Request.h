@@ -31,6 +31,7 @@ std::string snapshotPath(const std::string &selector, const std::string &rest = 
 
 /// Writes to standard output; throws Failure when that fails.
 void print(const std::string &text);
+/// A list takes a line for each element.
 void printJson(const Json::Value &value);
 
 /// Prints how far an export or import is, if one runs, as the handlers tell it under this path.

@@ -5,6 +5,7 @@
 #include "iscsiwebapi/ISCSIErrorCode.h"
 
 #include <cstdio>
+#include <unistd.h>
 
 namespace {
 
@@ -80,10 +81,8 @@ const char *hint(int code)
     case ISCSI::ERR_NOW_IS_NOT_IMPORTING:
     case ISCSI::ERR_IMPORT_INTERRUPT:
         return "'iscsictl lun show' tells whether something is imported into it";
-    case ISCSI::ERR_FAILED_TO_START_SERVICE:
-        return "'iscsi-host boot' starts the iSCSI service";
     default:
-        return nullptr;
+        return geteuid() == 0 ? nullptr : "the appliance's state is usually root's alone";
     }
 }
 

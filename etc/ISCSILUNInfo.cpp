@@ -11,6 +11,8 @@
 namespace ISCSI {
 namespace {
 
+using Key = Json::StaticString; // a key that is not copied
+
 /// What toJsonFormat returns for a record without identity; callers test for non-zero only.
 constexpr int NOT_ENOUGH_INFO = 3328;
 
@@ -176,18 +178,18 @@ int ISCSILUNInfo::toJsonFormat(Json::Value &out) const
                         toString().c_str());
     if (!out.isObject())
         out = Json::Value(Json::objectValue);
-    out["lun_id"] = lun_id;
-    out["type"] = static_cast<int>(type);
-    out["restored_time"] = static_cast<Json::Int64>(restored_time);
-    out["size"] = static_cast<Json::UInt64>(size);
-    out["uuid"] = uuid;
-    out["name"] = name;
-    out["location"] = location;
-    out["is_action_locked"] = is_action_locked;
-    out["is_mapped"] = is_mapped;
-    out["extent_size"] = extent_size;
-    out["allocated_size"] = static_cast<Json::UInt64>(allocated_size);
-    out["status"] = status;
+    out[Key("lun_id")] = lun_id;
+    out[Key("type")] = static_cast<int>(type);
+    out[Key("restored_time")] = static_cast<Json::Int64>(restored_time);
+    out[Key("size")] = static_cast<Json::UInt64>(size);
+    out[Key("uuid")] = uuid;
+    out[Key("name")] = name;
+    out[Key("location")] = location;
+    out[Key("is_action_locked")] = is_action_locked;
+    out[Key("is_mapped")] = is_mapped;
+    out[Key("extent_size")] = extent_size;
+    out[Key("allocated_size")] = static_cast<Json::UInt64>(allocated_size);
+    out[Key("status")] = status;
     return 0;
 }
 

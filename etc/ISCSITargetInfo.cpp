@@ -12,6 +12,8 @@
 namespace ISCSI {
 namespace {
 
+using Key = Json::StaticString; // a key that is not copied
+
 /// What toJsonFormat returns for a record without identity; callers test for non-zero only.
 constexpr int NOT_ENOUGH_INFO = 3328;
 
@@ -136,21 +138,21 @@ int ISCSITargetInfo::toJsonFormat(Json::Value &value) const
         return failText(here(), NOT_ENOUGH_INFO, "Not enough info to create target info in Json format: %s",
                         toString().c_str());
     value = Json::Value(Json::objectValue);
-    value["target_id"] = tid;
-    value["name"] = name;
-    value["iqn"] = iqn;
-    value["mapping_index"] = mapping_index;
-    value["is_enabled"] = is_enabled;
-    value["has_header_checksum"] = has_header_checksum;
-    value["has_data_checksum"] = has_data_checksum;
-    value["max_recv_seq_bytes"] = max_recv_seg_bytes;
-    value["max_send_seq_bytes"] = max_send_seg_bytes;
-    value["max_sessions"] = max_sessions;
-    value["auth_type"] = auth_type;
-    value["user"] = user;
-    value["password"] = password;
-    value["mutual_user"] = mutual_user;
-    value["mutual_password"] = mutual_password;
+    value[Key("target_id")] = tid;
+    value[Key("name")] = name;
+    value[Key("iqn")] = iqn;
+    value[Key("mapping_index")] = mapping_index;
+    value[Key("is_enabled")] = is_enabled;
+    value[Key("has_header_checksum")] = has_header_checksum;
+    value[Key("has_data_checksum")] = has_data_checksum;
+    value[Key("max_recv_seq_bytes")] = max_recv_seg_bytes;
+    value[Key("max_send_seq_bytes")] = max_send_seg_bytes;
+    value[Key("max_sessions")] = max_sessions;
+    value[Key("auth_type")] = auth_type;
+    value[Key("user")] = user;
+    value[Key("password")] = password;
+    value[Key("mutual_user")] = mutual_user;
+    value[Key("mutual_password")] = mutual_password;
     return 0;
 }
 

@@ -29,28 +29,38 @@ void removeScheduledJobs(const _tag_iscsi_lun_ &record, Site site = here())
     NORVRETENTIONRemovePolicy("Lun#", key);
 }
 
-/// Moving a LUN to or from the trash wins over loading it for a computation.
-void setLoadOptions(_tag_iscsi_lun_ &record, bool is_for_trash, bool is_for_unsync_size)
+/// Loads the LUN and says in its record what loading or unloading is for. Moving it to or from the
+/// trash wins over a computation.
+int loadWithOptions(ISCSILIBLUN &lun, bool is_for_trash, bool is_for_unsync_size, Site site)
 {
+    if (int err = lun.info.loadFromConfig(lun.record, 0))
+        return fail(err, lun.info, "Failed to load LUN config", site);
     if (is_for_trash)
-        record.options |= NORV_LUN_OPTION_TRASH;
+        lun.record.options |= NORV_LUN_OPTION_TRASH;
     else if (is_for_unsync_size)
-        record.options |= NORV_LUN_OPTION_UNSYNC_SIZE;
+        lun.record.options |= NORV_LUN_OPTION_UNSYNC_SIZE;
+    return 0;
 }
 
 /// Target IDs as the platform takes them: ascending, at the start of a zeroed array.
 struct TargetIDs {
     int ids[NORV_TARGET_ID_MAX] = {};
     int count = 0;
-
-    explicit TargetIDs(const std::set<int> &targets)
-    {
-        for (int tid : targets)
-            ids[count++] = tid;
-    }
-
-    static bool fits(const std::set<int> &targets) { return !targets.empty() && targets.size() <= NORV_TARGET_ID_MAX; }
 };
+
+/// Loads the LUN and takes 1 to NORV_TARGET_ID_MAX target IDs; the IDs are the platform's to judge.
+int loadWithTargets(ISCSILIBLUN &lun, const std::set<int> &targets, TargetIDs &out, Site site)
+{
+    if (int err = lun.info.loadFromConfig(lun.record, 0))
+        return fail(err, lun.info, "Failed to load LUN config", site);
+    if (targets.empty() || targets.size() > NORV_TARGET_ID_MAX)
+        return failText(site, ERR_BAD_TARGET_ID, "Invalid number of target ID: %zu info: %s. error: %d (%s)",
+                        targets.size(), lun.info.toString().c_str(), ERR_BAD_TARGET_ID,
+                        ErrorCodeToString(ERR_BAD_TARGET_ID));
+    for (int tid : targets)
+        out.ids[out.count++] = tid;
+    return 0;
+}
 
 std::string joined(const std::set<int> &numbers)
 {
@@ -129,9 +139,8 @@ int ISCSILIBLUN::isLUNMapped(bool &out)
 
 int ISCSILIBLUN::loadLUN(bool is_for_trash, bool is_for_unsync_size)
 {
-    if (int err = info.loadFromConfig(record, 0))
-        return fail(err, info, "Failed to load LUN config");
-    setLoadOptions(record, is_for_trash, is_for_unsync_size);
+    if (int err = loadWithOptions(*this, is_for_trash, is_for_unsync_size, here()))
+        return err;
     if (int err = NORViSCSILunLoad(&record))
         return failText(
             here(), err, "Failed to load LUN. is_for_trash: %s, is_for_unsync_size: %s info: %s. error: %d (%s)",
@@ -141,9 +150,8 @@ int ISCSILIBLUN::loadLUN(bool is_for_trash, bool is_for_unsync_size)
 
 int ISCSILIBLUN::unloadLUN(bool is_for_trash, bool is_for_unsync_size)
 {
-    if (int err = info.loadFromConfig(record, 0))
-        return fail(err, info, "Failed to load LUN config");
-    setLoadOptions(record, is_for_trash, is_for_unsync_size);
+    if (int err = loadWithOptions(*this, is_for_trash, is_for_unsync_size, here()))
+        return err;
     if (int err = NORViSCSILunUnload(&record))
         return failText(
             here(), err, "Failed to unload LUN. is_for_trash: %s, is_for_unsync_size: %s info: %s. error: %d (%s)",
@@ -187,13 +195,9 @@ int ISCSILIBLUN::ListLUN(std::vector<ISCSILUNInfo> &out, int filter)
 
 int ISCSILIBLUN::mapTarget(const std::set<int> &target_ids)
 {
-    if (int err = info.loadFromConfig(record, 0))
-        return fail(err, info, "Failed to load LUN config");
-    if (!TargetIDs::fits(target_ids))
-        return failText(here(), ERR_BAD_TARGET_ID, "Invalid number of target ID: %zu info: %s. error: %d (%s)",
-                        target_ids.size(), info.toString().c_str(), ERR_BAD_TARGET_ID,
-                        ErrorCodeToString(ERR_BAD_TARGET_ID));
-    const TargetIDs targets(target_ids);
+    TargetIDs targets;
+    if (int err = loadWithTargets(*this, target_ids, targets, here()))
+        return err;
     if (int err = NORViSCSILunMappingsAdd(targets.ids, info.lun_id, targets.count))
         return failText(here(), ERR_FAILED_TO_MAP_TARGET,
                         "Failed to add mappings. targets: %s. info: %s. error: %d (%s)", joined(target_ids).c_str(),
@@ -203,13 +207,9 @@ int ISCSILIBLUN::mapTarget(const std::set<int> &target_ids)
 
 int ISCSILIBLUN::unmapTarget(const std::set<int> &target_ids)
 {
-    if (int err = info.loadFromConfig(record, 0))
-        return fail(err, info, "Failed to load LUN config");
-    if (!TargetIDs::fits(target_ids))
-        return failText(here(), ERR_BAD_TARGET_ID, "Invalid number of target ID: %zu info: %s. error: %d (%s)",
-                        target_ids.size(), info.toString().c_str(), ERR_BAD_TARGET_ID,
-                        ErrorCodeToString(ERR_BAD_TARGET_ID));
-    const TargetIDs targets(target_ids);
+    TargetIDs targets;
+    if (int err = loadWithTargets(*this, target_ids, targets, here()))
+        return err;
     if (int err = NORViSCSILunMappingsRemove(targets.ids, info.lun_id, targets.count))
         return failText(here(), ERR_BAD_TARGET_ID, "Failed to remove mappings. targets: %s. info: %s. error: %d (%s)",
                         joined(target_ids).c_str(), info.toString().c_str(), err, ErrorCodeToString(err));

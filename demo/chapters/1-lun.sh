@@ -41,17 +41,25 @@ do_it iscsi-ls -i "$MALLORY" "iscsi://$PORTAL"
 same "targets that mallory sees" "$(iscsi-ls -i "$MALLORY" "iscsi://$PORTAL" 2>&1 | grep -c "$TARGET")" 0
 refused 'login|authori' iscsi-inq -i "$MALLORY" "iscsi://$PORTAL/$TARGET/1"
 
-tell "The LUN grows while it is in use."
+tell "The LUN grows while alice keeps 16 writes in flight; none of them fails."
+qemu-img bench -w -t none -c 20000 -d 16 -s 64k --image-opts "$(as "$ALICE" "$TARGET" 1)" >/tmp/bench 2>&1 &
+writer=$!
+until [[ -n $(ss -Htn state established "( dport = :3261 )") ]]; do
+    kill -0 "$writer" || wrong "the writer did not get started"
+done
 do_it iscsictl lun update disk --size 256M
+kill -0 "$writer" || wrong "the writer ended before the LUN grew"
+wait "$writer" || { indented </tmp/bench && wrong "a write failed while the LUN grew"; }
+do_it tail -n 1 /tmp/bench
 do_it iscsi-readcapacity16 -i "$ALICE" "iscsi://$PORTAL/$TARGET/1"
 
 tell "The service restarts; target, number, access list and data are as before."
+qemu-img convert --image-opts -O raw "$(as "$ALICE" "$TARGET" 1)" /tmp/before
 do_it iscsi-host stop
 do_it iscsi-host boot
 do_it iscsictl lun list --status
 do_it iscsictl target show store
 qemu-img convert --image-opts -O raw "$(as "$ALICE" "$TARGET" 1)" /tmp/again
-truncate -s 128M /tmp/again
-do_it sha256sum /tmp/again
-same "what alice read after the restart" "$(checksum /tmp/again)" "$(checksum /tmp/noise)"
+do_it sha256sum /tmp/before /tmp/again
+same "what alice read after the restart" "$(checksum /tmp/again)" "$(checksum /tmp/before)"
 refused 'login|authori' iscsi-inq -i "$MALLORY" "iscsi://$PORTAL/$TARGET/1"

@@ -1,5 +1,6 @@
 /// The functions of the public header.
 #include "host/core/LastError.h"
+#include "host/core/Lock.h"
 #include "host/services/Events.h"
 #include "host/services/Retention.h"
 #include "host/services/Schedules.h"
@@ -8,19 +9,15 @@
 #include "host/storage/LunStore.h"
 #include "host/storage/Sweep.h"
 #include "host/storage/Volumes.h"
+#include "host/target/Portals.h"
 #include "host/target/Service.h"
 #include "iscsihost/host.h"
-#include "platform/error.h"
 
-#include <arpa/inet.h>
 #include <sys/statvfs.h>
 
 using namespace norvhost;
 
 namespace {
-
-constexpr const char *portal_setting = "portal";
-constexpr const char *all_addresses = "all";
 
 int describe(const VolumeRow &row, iscsihost::Volume &volume)
 {
@@ -60,6 +57,16 @@ void note(int err, int &first, std::vector<std::string> &failed)
 } // namespace
 
 namespace iscsihost {
+
+struct MaskingChange::Lock : NamedLock {};
+
+MaskingChange::MaskingChange() : lock(std::make_unique<Lock>()) {}
+MaskingChange::~MaskingChange() = default;
+
+int MaskingChange::begin(int tid)
+{
+    return lock->take("masking-" + std::to_string(tid));
+}
 
 int addVolume(const std::string &folder)
 {
@@ -131,19 +138,23 @@ int stop()
     return stopService();
 }
 
-int setPortal(const std::string &address)
+int setPortal(const std::string &addresses)
 {
-    in6_addr parsed;
-    if (address != all_addresses && inet_pton(AF_INET, address.c_str(), &parsed) != 1 &&
-        inet_pton(AF_INET6, address.c_str(), &parsed) != 1)
-        return fail(NORV_ERR_BAD_PARAMETER, "'%s' is no IPv4 or IPv6 address, nor '%s'", address.c_str(),
-                    all_addresses);
-    return setSetting(portal_setting, address);
+    Transaction transaction;
+    if (transaction.error())
+        return transaction.error();
+    if (int err = setSetting("portal", addresses))
+        return err;
+    // Read as the service will read it: what it would not take is not stored.
+    std::vector<std::string> parsed;
+    if (int err = portalAddresses(parsed))
+        return err;
+    return transaction.commit();
 }
 
-int getPortal(std::string &address)
+int getPortal(std::string &addresses)
 {
-    return getSetting(portal_setting, all_addresses, address);
+    return getSetting("portal", "all", addresses);
 }
 
 int status(Status &status)

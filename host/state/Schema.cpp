@@ -178,7 +178,7 @@ int readVersion(sqlite3 *connection, int &version)
 /// One step, inside a transaction.
 int takeStep(sqlite3 *connection)
 {
-    int version;
+    int version = 0;
     if (int err = readVersion(connection, version))
         return err;
     if (version >= latest)
@@ -199,7 +199,7 @@ int schemaVersion()
 int upgradeSchema(sqlite3 *connection)
 {
     for (;;) {
-        int version;
+        int version = 0;
         if (int err = readVersion(connection, version))
             return err;
         if (version > latest)

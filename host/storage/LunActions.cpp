@@ -49,7 +49,7 @@ int reserveLunId(LunLock &lock, int action, int &lid)
         if (missing)
             return missing;
     }
-    return fail(NORV_ERR_MAX_LUNS, "there are %d LUNs or more are being created: that is the most", NORV_LUN_ID_MAX);
+    return fail(NORV_ERR_MAX_LUNS, "there are %d LUNs, those being created included: more cannot be", NORV_LUN_ID_MAX);
 }
 
 } // namespace

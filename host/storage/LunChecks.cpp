@@ -111,6 +111,14 @@ int checkVolume(_tag_iscsi_lun_ &lun)
     return 0;
 }
 
+/// An ASCII character as an error shows it.
+std::string characterName(char character)
+{
+    if (character > ' ' && character < 0x7f)
+        return {'\'', character, '\''};
+    return "the character with code " + std::to_string(character);
+}
+
 int checkName(int code, std::string_view name)
 {
     if (name.empty())
@@ -127,9 +135,9 @@ int checkName(int code, std::string_view name)
         if (static_cast<unsigned char>(rest[0]) < 0x80) {
             if (!isAsciiAllowed(static_cast<unsigned char>(rest[0])))
                 return fail(code,
-                            "the name holds a character (code %d) that is not allowed: letters, digits, spaces inside "
-                            "and . _ - : @ + = ( ) are",
-                            rest[0]);
+                            "the name holds %s, which is not allowed: letters, digits, spaces inside and "
+                            ". _ - : @ + = ( ) are",
+                            characterName(rest[0]).c_str());
             rest.remove_prefix(1);
             continue;
         }
@@ -226,7 +234,7 @@ int checkNewLun(_tag_iscsi_lun_ &lun)
     if (int err = checkLunName(lun.name))
         return err;
     if (lun.extent_size % block_size != 0)
-        return fail(NORV_ERR_BAD_PARAMETER, "the extent size %u is no multiple of 512 bytes", lun.extent_size);
+        return fail(NORV_ERR_LUN_EXTENT_SIZE, "the extent size %u is no multiple of 512 bytes", lun.extent_size);
     if (isBlock(lun.type))
         return checkDevice(lun);
     if (int err = checkVolume(lun))

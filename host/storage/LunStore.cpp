@@ -67,7 +67,7 @@ int checkDeviceUnused(const LunRow &row)
 
 int refuseMapped(int lid)
 {
-    int mappings;
+    int mappings = 0;
     if (int err = countMappings(lid, mappings))
         return err;
     if (mappings > 0)

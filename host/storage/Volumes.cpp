@@ -13,6 +13,7 @@
 #include <climits>
 #include <cstdlib>
 #include <fcntl.h>
+#include <filesystem>
 #include <memory>
 #include <sys/stat.h>
 #include <sys/xattr.h>
@@ -58,6 +59,9 @@ int canonicalFolder(const std::string &folder, std::string &path)
         return fail(NORV_ERR_LUN_LOCATION, "the path has %zu bytes, %zu are allowed", path.size(), longest_path);
     if (std::any_of(path.begin(), path.end(), [](unsigned char c) { return c < ' ' || c == 0x7f; }))
         return fail(NORV_ERR_LUN_LOCATION, "the path '%s' holds control characters", path.c_str());
+    // Readers of map files look for them with patterns made of the path.
+    if (path.find_first_of("*?[\\") != std::string::npos)
+        return fail(NORV_ERR_LUN_LOCATION, "the path '%s' holds one of * ? [ \\", path.c_str());
     return 0;
 }
 
@@ -141,9 +145,50 @@ int registerMounted(const std::string &path, const std::string &image)
     return insertVolume({path, mountPointOf(path), image});
 }
 
+int checkEmptyFolder(const std::string &path)
+{
+    if (isMountRoot(path))
+        return fail(NORV_ERR_FILE_EXISTS, "something is mounted at %s already", path.c_str());
+    std::error_code error;
+    if (!std::filesystem::is_empty(path, error))
+        return fail(NORV_ERR_FILE_EXISTS, "the folder %s is not empty: a volume would hide what it holds",
+                    path.c_str());
+    return 0;
+}
+
+int createInFolder(const std::string &folder, uint64_t size, const std::string &image)
+{
+    VolumeRow row;
+    if (int err = canonicalFolder(folder, row.path))
+        return err;
+    if (int err = checkEmptyFolder(row.path))
+        return err;
+    // Absolute: the row outlives this process's working folder.
+    std::error_code error;
+    row.image = std::filesystem::absolute(image, error);
+    if (image.empty())
+        if (int err = defaultImage(row.path, row.image))
+            return err;
+
+    if (int err = makeImage(row.image, size)) {
+        if (err != NORV_ERR_FILE_EXISTS)
+            unlink(row.image.c_str());
+        return err;
+    }
+    int err = mountImage(row.image, row.path);
+    if (!err && (err = registerMounted(row.path, row.image)) != 0) {
+        const std::string reason = lastError();
+        if (unmount(row.path) == 0)
+            fail(err, "%s", reason.c_str());
+    }
+    if (err)
+        unlink(row.image.c_str());
+    return err;
+}
+
 int checkNoLuns(const std::string &path)
 {
-    int luns;
+    int luns = 0;
     if (int err = countLuns(path, luns))
         return err;
     return luns == 0 ? 0 : fail(NORV_ERR_REMOVE_CONFIG, "%d LUN(s) live on %s: delete them first", luns, path.c_str());
@@ -195,35 +240,12 @@ int createVolume(const std::string &folder, uint64_t size, const std::string &im
 {
     if (size < smallest_image || size > INT64_MAX || size % 4096 != 0)
         return fail(NORV_ERR_LUN_SIZE, "an XFS volume has at least 300 MiB, in whole 4096-byte blocks");
-    if (mkdir(folder.c_str(), 0755) != 0 && errno != EEXIST)
+    const bool made = mkdir(folder.c_str(), 0755) == 0;
+    if (!made && errno != EEXIST)
         return failErrno(NORV_ERR_MAKE_DIRECTORY, errno, "cannot make the folder '%s'", folder.c_str());
-    VolumeRow row;
-    if (int err = canonicalFolder(folder, row.path))
-        return err;
-    if (isMountRoot(row.path))
-        return fail(NORV_ERR_FILE_EXISTS, "something is mounted at %s already", row.path.c_str());
-    row.image = image;
-    if (image.empty())
-        if (int err = defaultImage(row.path, row.image))
-            return err;
-
-    if (int err = makeImage(row.image, size)) {
-        if (err != NORV_ERR_FILE_EXISTS)
-            unlink(row.image.c_str());
-        return err;
-    }
-    // The row outlives this process's working folder.
-    const std::unique_ptr<char, decltype(&free)> resolved(realpath(row.image.c_str(), nullptr), free);
-    if (resolved)
-        row.image = resolved.get();
-    int err = mountImage(row.image, row.path);
-    if (!err && (err = registerMounted(row.path, row.image)) != 0) {
-        const std::string reason = lastError();
-        if (unmount(row.path) == 0)
-            fail(err, "%s", reason.c_str());
-    }
-    if (err)
-        unlink(row.image.c_str());
+    const int err = createInFolder(folder, size, image);
+    if (err && made)
+        rmdir(folder.c_str());
     return err;
 }
 

@@ -26,6 +26,8 @@ constexpr auto unit_end_limit = 5s;
 /// What tgtd takes for our 0, the default; larger than its own 8 KiB, which costs a third of the write speed.
 constexpr uint32_t default_segment = 262144;
 
+constexpr const char *ping_interval_seconds = "10", *pings_unanswered = "3";
+
 /// What a target is to be on one daemon.
 struct Wanted {
     _tag_iscsi_target_ target = {};
@@ -358,6 +360,9 @@ int Reconciler::adjustParameters(const Wanted &wanted)
         {"DataDigest", digest(target.data_digest)},
         {"MaxRecvDataSegmentLength", length(target.max_recv_seg_bytes)},
         {"MaxXmitDataSegmentLength", length(target.max_send_seg_bytes)},
+        // Where sessions are counted, one whose initiator vanished must not hold its place for ever.
+        {"nop_interval", target.max_sessions ? ping_interval_seconds : "0"},
+        {"nop_count", target.max_sessions ? pings_unanswered : "0"},
     };
     std::map<std::string, std::string> shown;
     if (int err = daemon.showParameters(target.tid, shown))

@@ -7,6 +7,7 @@
 
 #include <arpa/inet.h>
 #include <cerrno>
+#include <csignal>
 #include <cstdio>
 #include <cstring>
 #include <fcntl.h>
@@ -32,6 +33,33 @@ struct EndSession {
     void operator()(iscsi_context *session) const { iscsi_destroy_context(session); }
 };
 using Session = std::unique_ptr<iscsi_context, EndSession>;
+
+/// libiscsi writes to its socket without regard to SIGPIPE, which would end a caller that knows of no socket.
+class PipeSignalBlock {
+public:
+    PipeSignalBlock()
+    {
+        sigset_t waiting;
+        sigemptyset(&pipe_signal);
+        sigaddset(&pipe_signal, SIGPIPE);
+        sigpending(&waiting);
+        was_waiting = sigismember(&waiting, SIGPIPE);
+        pthread_sigmask(SIG_BLOCK, &pipe_signal, &before);
+    }
+    ~PipeSignalBlock()
+    {
+        const timespec now = {};
+        if (!was_waiting)
+            sigtimedwait(&pipe_signal, nullptr, &now);
+        pthread_sigmask(SIG_SETMASK, &before, nullptr);
+    }
+    PipeSignalBlock(const PipeSignalBlock &) = delete;
+    PipeSignalBlock &operator=(const PipeSignalBlock &) = delete;
+
+private:
+    sigset_t pipe_signal, before;
+    bool was_waiting;
+};
 
 /// Lets a name in for as long as the object lives. What a killed process leaves goes at the next reconcile.
 class TemporaryInitiator {
@@ -235,6 +263,7 @@ int reopenUnit(const Tgtd &daemon, const _tag_iscsi_target_ &target, uint64_t lu
         const int err = waitForNobody(daemon, target.tid);
         return err ? err : swapPath(daemon, target.tid, lun, path);
     }
+    const PipeSignalBlock no_signal;
     const std::string initiator = "iqn.2001-01.norv:host-" + newUuid();
     const TemporaryInitiator admitted(daemon, target.tid, initiator);
     if (admitted.error())
@@ -245,7 +274,7 @@ int reopenUnit(const Tgtd &daemon, const _tag_iscsi_target_ &target, uint64_t lu
     TgtdConnection ours;
     if (int err = findConnection(daemon, target.tid, initiator, ours))
         return err;
-    size_t pings;
+    size_t pings = 0;
     if (int err = stopQueue(session, lun, pings))
         return err;
     if (int err = waitForIdle(daemon, ours, target.tid, lun, pings))

@@ -24,6 +24,7 @@
 #include <poll.h>
 #include <spawn.h>
 #include <sys/signalfd.h>
+#include <sys/stat.h>
 #include <sys/wait.h>
 #include <syslog.h>
 
@@ -40,9 +41,11 @@ using namespace std::chrono_literals;
 
 constexpr auto start_limit = 10s;
 constexpr auto stop_limit = 5s;
-constexpr auto supervise_interval = 5s;
+constexpr auto supervise_interval = 5s, retry_interval = 1s;
 
 constexpr const char *tgtd_program = "/usr/sbin/tgtd";
+
+constexpr off_t messages_max = 1 << 20;
 
 /// Two worker threads a unit: the default of 16 makes 1,601 threads of 100 LUNs.
 constexpr const char *tgtd_threads = "2";
@@ -68,8 +71,8 @@ int spawnDaemon(const std::string &name, std::vector<std::string> arguments, con
     posix_spawn_file_actions_init(&actions);
     // Read-only on purpose: a write that a bug sends to descriptor 0 fails instead of being swallowed.
     posix_spawn_file_actions_addopen(&actions, STDIN_FILENO, "/dev/null", O_RDONLY, 0);
-    posix_spawn_file_actions_addopen(&actions, STDOUT_FILENO, messagesPath(name).c_str(), O_WRONLY | O_CREAT | O_TRUNC,
-                                     0600);
+    posix_spawn_file_actions_addopen(&actions, STDOUT_FILENO, messagesPath(name).c_str(),
+                                     O_WRONLY | O_CREAT | O_TRUNC | O_APPEND, 0600);
     posix_spawn_file_actions_adddup2(&actions, STDOUT_FILENO, STDERR_FILENO);
     posix_spawn_file_actions_addclosefrom_np(&actions, STDERR_FILENO + 1);
 
@@ -99,6 +102,17 @@ int spawnDaemon(const std::string &name, std::vector<std::string> arguments, con
     posix_spawnattr_destroy(&attributes);
     posix_spawn_file_actions_destroy(&actions);
     return errnum ? failErrno(NORV_ERR_START_SERVICE, errnum, "cannot run %s", arguments[0].c_str()) : 0;
+}
+
+/// tgtd tells every failed command; on a broken disk that is a lot.
+void cutMessages()
+{
+    for (const char *name : {"tgtd-rw", "tgtd-ro", "iscsi-portald"}) {
+        struct stat status;
+        const std::string path = messagesPath(name);
+        if (stat(path.c_str(), &status) == 0 && status.st_size > messages_max && truncate(path.c_str(), 0) != 0)
+            syslog(LOG_WARNING, "cannot cut %s: %s", path.c_str(), strerror(errno));
+    }
 }
 
 bool hasEnded(pid_t pid)
@@ -179,7 +193,7 @@ int startTgtd(const Tgtd &daemon)
 
     const std::string name = std::string("tgtd-") + daemon.name();
     pid_t pid;
-    if (int err = spawnDaemon(name, {tgtd_program, "-D", "-t", tgtd_threads, "--iscsi", option},
+    if (int err = spawnDaemon(name, {tgtd_program, "-f", "-t", tgtd_threads, "--iscsi", option},
                               "TGT_IPC_SOCKET=" + daemon.socketVariable(), pid))
         return err;
     bool ended = false, serves = false;
@@ -262,7 +276,8 @@ bool waitForEvent(int signals)
     std::vector<pollfd> events = {{signals, POLLIN, 0}};
     for (const FileDescriptor &process : processes)
         events.push_back({process.get(), POLLIN, 0});
-    poll(events.data(), events.size(), static_cast<int>(std::chrono::milliseconds(supervise_interval).count()));
+    const std::chrono::milliseconds interval = processes.size() == 3 ? supervise_interval : retry_interval;
+    poll(events.data(), events.size(), static_cast<int>(interval.count()));
     return events[0].revents != 0;
 }
 
@@ -315,10 +330,11 @@ int superviseService()
     if (int err = startService())
         return err;
     do {
-        while (waitpid(-1, nullptr, WNOHANG) > 0)
-            ;
         if (int err = startMissing())
             syslog(LOG_ERR, "the iSCSI service is not complete (%d): %s", err, lastError());
+        cutMessages();
+        while (waitpid(-1, nullptr, WNOHANG) > 0)
+            ;
     } while (!waitForEvent(stop.get()));
     return stopService();
 }

@@ -338,7 +338,7 @@ int Tgtd::exchange(const Request &request, std::string *answer, uint32_t &daemon
         message.append(request.text.c_str(), request.text.size() + 1);
 
     const FileDescriptor socket_fd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
-    const timeval timeout = {timeout_ms / 1000, timeout_ms % 1000 * 1000};
+    const timeval timeout = {timeout_ms / 1000, timeout_ms % 1000 * 1000L};
     setsockopt(socket_fd.get(), SOL_SOCKET, SO_RCVTIMEO, &timeout, sizeof timeout);
     setsockopt(socket_fd.get(), SOL_SOCKET, SO_SNDTIMEO, &timeout, sizeof timeout);
     // A request goes out in one piece right behind the connect: tgtd 1.0.85 can spin on a connection
@@ -369,7 +369,7 @@ int Tgtd::call(const Request &request, std::string *answer) const
     static const char *const operations[] = {"create", "delete", "show", "bind", "unbind", "update", "count"};
     static const char *const modes[] = {"system", "target",  "unit",       "portal",
                                         "driver", "session", "connection", "account"};
-    uint32_t error;
+    uint32_t error = daemon_ok;
     if (int err = exchange(request, answer, error))
         return err;
     if (request.daemon_error)
@@ -526,7 +526,7 @@ int Tgtd::createTarget(int tid, const std::string &iqn) const
 
 int Tgtd::deleteTarget(int tid, bool &busy) const
 {
-    uint32_t error;
+    uint32_t error = daemon_ok;
     Request request = {mode_target, op_delete, tid};
     request.tolerated = {daemon_no_target, daemon_target_active, daemon_unit_active};
     request.daemon_error = &error;
@@ -557,7 +557,7 @@ int Tgtd::updateUnit(int tid, uint64_t lun, const std::string &settings) const
 
 int Tgtd::deleteUnit(int tid, uint64_t lun, bool &busy) const
 {
-    uint32_t error;
+    uint32_t error = daemon_ok;
     Request request = {mode_unit, op_delete, tid, "", lun};
     request.tolerated = {daemon_no_unit, daemon_unit_active};
     request.daemon_error = &error;
@@ -595,7 +595,7 @@ int Tgtd::unbindUser(int tid, const std::string &user, bool outgoing) const
 
 int Tgtd::bindInitiator(int tid, const std::string &name, bool *added) const
 {
-    uint32_t error;
+    uint32_t error = daemon_ok;
     Request request = {mode_target, op_bind, tid};
     request.text = (name == any_address ? "initiator-address=" : "initiator-name=") + name;
     request.tolerated = {daemon_name_bound};

@@ -151,9 +151,12 @@ int stop()
     return exit_ok;
 }
 
-int setPortal(const std::string &address)
+int setPortal(const std::vector<std::string> &addresses)
 {
-    if (int err = iscsihost::setPortal(address))
+    std::string joined;
+    for (const std::string &address : addresses)
+        joined += (joined.empty() ? "" : " ") + address;
+    if (int err = iscsihost::setPortal(joined))
         return failed("portal set", err);
     return exit_ok;
 }
@@ -207,9 +210,7 @@ int runDue()
     return err ? exit_failed : exit_ok;
 }
 
-} // namespace
-
-int main(int argc, char **argv)
+int runTool(int argc, char **argv)
 {
     CLI::App app("Volumes and the iSCSI service of this machine.", "iscsi-host");
     app.require_subcommand(1);
@@ -217,7 +218,8 @@ int main(int argc, char **argv)
                "Exit status: 0 done, 1 failed, 2 wrong usage.");
 
     int status = exit_ok;
-    std::string folder, image, address;
+    std::string folder, image;
+    std::vector<std::string> addresses;
     uint64_t size = 0;
     bool as_json = false;
 
@@ -251,12 +253,12 @@ int main(int argc, char **argv)
     show->add_flag("--json", as_json, "For programs");
     show->callback([&] { status = showStatus(as_json); });
 
-    CLI::App *portal = app.add_subcommand("portal", "The address that initiators connect to");
+    CLI::App *portal = app.add_subcommand("portal", "The addresses that initiators connect to");
     portal->require_subcommand(1);
-    CLI::App *set = portal->add_subcommand("set", "Set the address; 'all' for every address of the machine");
-    set->add_option("ADDR", address, "IPv4 or IPv6 address, or 'all'; takes effect when the service starts")
+    CLI::App *set = portal->add_subcommand("set", "Set them; 'all' for every address of the machine");
+    set->add_option("ADDR", addresses, "IPv4 or IPv6 addresses, or 'all'; they take effect when the service starts")
         ->required();
-    set->callback([&] { status = setPortal(address); });
+    set->callback([&] { status = setPortal(addresses); });
 
     CLI::App *schedule = app.add_subcommand("schedule", "Jobs of LUNs; 'iscsictl schedule' shows and changes them");
     schedule->require_subcommand(1);
@@ -270,4 +272,16 @@ int main(int argc, char **argv)
         return app.exit(error) == 0 ? exit_ok : exit_usage;
     }
     return status;
+}
+
+} // namespace
+
+int main(int argc, char **argv)
+{
+    try {
+        return runTool(argc, argv);
+    } catch (const std::exception &error) {
+        fprintf(stderr, "iscsi-host: %s\n", error.what());
+        return exit_failed;
+    }
 }

@@ -1,19 +1,16 @@
-"""iscsictl as its users meet it: iscsictl_test.py ISCSICTL ISCSI_HOST"""
+"""iscsictl as its users meet it, on an appliance whose daemons do not run. Needs no root."""
 
 import json
 import os
 import pty
-import shutil
 import subprocess
-import sys
-import tempfile
 import unicodedata
 import unittest
 
-ISCSICTL, ISCSI_HOST = (os.path.abspath(path) for path in sys.argv[1:3])
+from appliance import ISCSI_HOST, ISCSICTL, Appliance
 
-LUN_KEYS = {"lun_id", "type", "restored_time", "size", "uuid", "name", "location", "is_action_locked", "is_mapped",
-            "extent_size"}
+LUN_KEYS = {"lun_id", "type", "restored_time", "size", "uuid", "name", "location", "is_mapped", "extent_size"}
+STATUS_KEYS = {"status", "allocated_size", "is_action_locked"}
 MIB = 1 << 20
 
 
@@ -22,42 +19,12 @@ def width(text):
     return sum(0 if unicodedata.combining(c) else 2 if unicodedata.east_asian_width(c) in "WF" else 1 for c in text)
 
 
-class Appliance(unittest.TestCase):
-    """A state folder and a volume of its own; no daemon runs."""
-
-    def setUp(self):
-        self.folder = tempfile.mkdtemp(prefix="iscsictl-test.")
-        self.addCleanup(shutil.rmtree, self.folder)
-        self.volume = os.path.join(self.folder, "volume")
-        os.mkdir(self.volume)
-        self.env = dict(os.environ, ISCSI_HOST_STATE=os.path.join(self.folder, "state"),
-                        ISCSI_HOST_RUN=os.path.join(self.folder, "run"))
-        subprocess.run([ISCSI_HOST, "volume", "add", self.volume], env=self.env, check=True, stdout=subprocess.DEVNULL)
-
-    def run_cli(self, *args, stdin=""):
-        return subprocess.run([ISCSICTL, *args], env=self.env, input=stdin, capture_output=True, text=True,
-                              errors="surrogateescape", timeout=60)
-
-    def ok(self, *args, **kwargs):
-        result = self.run_cli(*args, **kwargs)
-        self.assertEqual((result.returncode, result.stderr), (0, ""), args)
-        return result.stdout
-
-    def fails(self, status, *args, says, **kwargs):
-        result = self.run_cli(*args, **kwargs)
-        self.assertEqual(result.returncode, status, (args, result.stdout, result.stderr))
-        self.assertEqual(result.stdout, "", args)
-        self.assertRegex(result.stderr, says)
-        return result.stderr
-
-    def create(self, name, *args, size="16M"):
-        return json.loads(self.ok("lun", "create", "--json", "--size", size, "--location", self.volume, *args, "--", name))
-
-    def luns(self):
-        return json.loads(self.ok("lun", "list", "--json"))
-
-    def files(self):
-        return sorted(os.path.join(folder, name) for folder, _, names in os.walk(self.volume) for name in names)
+def commands(program):
+    """The commands of a program that its help lists, "volume add", down to the last."""
+    help_text = subprocess.run([*program, "--help"], capture_output=True, text=True, check=True).stdout
+    names = [line.split()[0] for line in help_text.partition("Subcommands:\n")[2].partition("\n\n")[0].splitlines()]
+    return [" ".join([name, *rest]).strip() for name in names for rest in
+            ([[below] for below in commands([*program, name])] or [[]])]
 
 
 class Luns(Appliance):
@@ -71,7 +38,7 @@ class Luns(Appliance):
                          ("vol1", 7, 1536 * MIB, self.volume, False))
 
         shown = json.loads(self.ok("lun", "show", "vol1", "--json"))
-        self.assertEqual(set(shown), LUN_KEYS | {"status", "allocated_size", "targets"})
+        self.assertEqual(set(shown), LUN_KEYS | STATUS_KEYS | {"targets"})
         self.assertEqual(shown["targets"], [])
         text = self.ok("lun", "show", "vol1")
         self.assertRegex(text, r"(?m)^Size: +1\.5G \(1610612736 bytes\)$")
@@ -83,7 +50,7 @@ class Luns(Appliance):
         self.ok("lun", "update", "vol1", "--name", "list", "--size", "2G")
         self.assertEqual([(l["name"], l["size"]) for l in self.luns()], [("list", 2048 * MIB)])
         status = json.loads(self.ok("lun", "list", "--status", "--json"))
-        self.assertEqual(set(status[0]), LUN_KEYS | {"status", "allocated_size"})
+        self.assertEqual(set(status[0]), LUN_KEYS | STATUS_KEYS)
         # A name that is also a verb is a name where a name belongs.
         self.ok("lun", "delete", "list", "--yes")
         self.assertEqual((self.luns(), self.files()), ([], []))
@@ -317,13 +284,17 @@ class Manual(Appliance):
             file.write("before\n@COMMANDS@\nafter\n")
         text = self.ok("__manual", source)
         self.assertTrue(text.startswith("before\n.SS ") and text.endswith("after\n"))
-        for noun in ("lun", "target"):
-            verbs = [line.split()[0] for line in self.ok(noun, "--help").partition("Subcommands:\n")[2].splitlines() if line]
-            self.assertGreaterEqual(len(verbs), 5)
-            for verb in verbs:
-                self.assertIn(f"\n.SS {noun} {verb}\n", text)
+        verbs = commands([ISCSICTL])
+        self.assertGreaterEqual(len(verbs), 16)
+        for verb in verbs:
+            self.assertIn(f"\n.SS {verb}\n", text)
+        page = os.path.join(os.path.dirname(os.path.abspath(__file__)), "../../docs/man/iscsi-host.8")
+        with open(page) as file:
+            written = file.read().replace("\\-", "-").replace("\\fB", "").replace("\\fR", "").replace(".B ", "")
+        for command in commands([ISCSI_HOST]):
+            self.assertRegex(written, rf"(?m)^{command}\b")
         self.assertIn("\\fB\\-\\-chap\\-secret\\-file\\fR \\fIFILE\\fR\n", text)
 
 
 if __name__ == "__main__":
-    unittest.main(argv=sys.argv[:1] + sys.argv[3:])
+    unittest.main()

@@ -15,7 +15,6 @@ namespace {
 using namespace ISCSI;
 using cli::parseSize;
 using webapi::Field;
-using webapi::Fields;
 using webapi::Method;
 using webapi::Type;
 

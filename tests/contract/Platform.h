@@ -1,6 +1,7 @@
 /// The platform under test: made empty for a test, and cleared away behind it.
 #pragma once
 
+#include <cstddef>
 #include <string>
 
 namespace contract {
@@ -22,5 +23,12 @@ public:
 
     std::string volume; ///< a location for LUNs, with room for a few small ones
 };
+
+/// Copies a text into a character field.
+template <size_t size>
+void set(char (&field)[size], const std::string &text)
+{
+    field[text.copy(field, size - 1)] = '\0';
+}
 
 } // namespace contract

@@ -28,8 +28,8 @@ protected:
         _tag_iscsi_lun_ lun{};
         lun.type = type;
         lun.size = size;
-        name.copy(lun.name, sizeof(lun.name) - 1);
-        platform.volume.copy(lun.location, sizeof(lun.location) - 1);
+        set(lun.name, name);
+        set(lun.location, platform.volume);
         return lun;
     }
 
@@ -113,7 +113,7 @@ TEST_F(LUNContract, BadRequestsLeaveNothing)
     for (auto [err, lun] : cases)
         EXPECT_EQ(NORViSCSILunCreate(&lun), err) << lun.name << ' ' << lun.type << ' ' << lun.size;
     auto elsewhere = request("n");
-    strcpy(elsewhere.location, "/no/such/volume");
+    set(elsewhere.location, "/no/such/volume");
     EXPECT_EQ(NORViSCSILunCreate(&elsewhere), NORV_ERR_LUN_LOCATION);
     EXPECT_EQ(names(), std::vector<std::string>{"taken"});
 }
@@ -130,7 +130,7 @@ TEST_F(LUNContract, WhatDoesNotExistIsSaid)
     EXPECT_EQ(NORViSCSIFamilyConfGetByLID(1000, &family), NORV_ERR_NO_SUCH_FAMILY);
 
     auto gone = request("gone");
-    strcpy(gone.uuid, NO_UUID);
+    set(gone.uuid, NO_UUID);
     EXPECT_EQ(NORViSCSILunUpdate(&gone), NORV_ERR_NO_SUCH_LUN);
     EXPECT_EQ(NORViSCSILunLoad(&gone), NORV_ERR_NO_SUCH_LUN);
     EXPECT_EQ(NORViSCSILunUnload(&gone), NORV_ERR_NO_SUCH_LUN);
@@ -157,7 +157,7 @@ TEST_F(LUNContract, UpdateRenamesAndGrows)
     create("taken");
     auto lun = created;
     EXPECT_EQ(NORViSCSILunUpdate(&lun), 0) << "nothing to change is no failure";
-    strcpy(lun.name, "after");
+    set(lun.name, "after");
     lun.size = 8 * MIB;
     EXPECT_EQ(NORViSCSILunUpdate(&lun), 0);
     EXPECT_STREQ(byUUID(created.uuid).name, "after");
@@ -166,9 +166,9 @@ TEST_F(LUNContract, UpdateRenamesAndGrows)
     lun.size = 4 * MIB;
     EXPECT_EQ(NORViSCSILunUpdate(&lun), NORV_ERR_LUN_SIZE) << "shrinks";
     lun.size = 8 * MIB;
-    strcpy(lun.name, "taken");
+    set(lun.name, "taken");
     EXPECT_EQ(NORViSCSILunUpdate(&lun), NORV_ERR_LUN_NAME_EXISTS);
-    strcpy(lun.name, "a/b");
+    set(lun.name, "a/b");
     EXPECT_EQ(NORViSCSILunUpdate(&lun), NORV_ERR_LUN_NAME);
     EXPECT_STREQ(byUUID(created.uuid).name, "after");
     EXPECT_EQ(byUUID(created.uuid).size, 8 * MIB);

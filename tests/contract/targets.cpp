@@ -29,10 +29,10 @@ protected:
         target.max_recv_seg_bytes = target.max_send_seg_bytes = 262144;
         target.header_digest = 1;
         target.auth_type = NORV_TARGET_AUTH_CHAP;
-        name.copy(target.name, sizeof(target.name) - 1);
-        ("iqn.2000-01.example:" + name).copy(target.iqn, sizeof(target.iqn) - 1);
-        strcpy(target.user, "alice");
-        strcpy(target.password, "secret-of-alice");
+        set(target.name, name);
+        set(target.iqn, "iqn.2000-01.example:" + name);
+        set(target.user, "alice");
+        set(target.password, "secret-of-alice");
         return target;
     }
 
@@ -48,8 +48,8 @@ protected:
         _tag_iscsi_lun_ lun{};
         lun.type = NORV_LUN_TYPE_ADV;
         lun.size = 4 << 20;
-        name.copy(lun.name, sizeof(lun.name) - 1);
-        platform.volume.copy(lun.location, sizeof(lun.location) - 1);
+        set(lun.name, name);
+        set(lun.location, platform.volume);
         EXPECT_EQ(NORViSCSILunCreate(&lun), 0);
         return lun;
     }
@@ -104,7 +104,7 @@ protected:
             _tag_struct_iscsi_acl_ entry{};
             entry.tid = tid;
             entry.permission = permission;
-            iqn.copy(entry.iqn, sizeof(entry.iqn) - 1);
+            set(entry.iqn, iqn);
             result.push_back(entry);
         }
         return result;
@@ -147,12 +147,12 @@ TEST_F(TargetContract, BadRequestsLeaveNothing)
 {
     create("taken");
     auto same_name = request("taken");
-    strcpy(same_name.iqn, "iqn.2000-01.example:free");
+    set(same_name.iqn, "iqn.2000-01.example:free");
     auto same_iqn = request("taken");
-    strcpy(same_iqn.name, "free");
+    set(same_iqn.name, "free");
     auto nameless = request("");
     auto bad_iqn = request("n");
-    strcpy(bad_iqn.iqn, "");
+    set(bad_iqn.iqn, "");
     auto bad_auth = request("n");
     bad_auth.auth_type = 3;
     EXPECT_EQ(NORViSCSITargetCreate(&same_name), NORV_ERR_TARGET_NAME);

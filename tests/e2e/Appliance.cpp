@@ -28,10 +28,15 @@ Appliance::Appliance()
     char folder[] = "/tmp/e2e-XXXXXX";
     root = mkdtemp(folder);
     setenv("ISCSI_HOST_STATE", (root + "/state").c_str(), 1);
+    setenv("ISCSI_HOST_PORTALD", PORTALD_PATH, 1);
     setenv("ISCSI_HOST_RUN", (root + "/run").c_str(), 1);
     std::filesystem::create_directory(root + "/volume");
     EXPECT_EQ(iscsihost::addVolume(root + "/volume"), 0) << iscsi_host_last_error();
-    EXPECT_EQ(norvhost::startService(), 0) << iscsi_host_last_error();
+}
+
+void Appliance::SetUp()
+{
+    ASSERT_EQ(norvhost::startService(), 0) << iscsi_host_last_error();
 }
 
 Appliance::~Appliance()
@@ -46,8 +51,8 @@ _tag_iscsi_lun_ Appliance::createLun(const std::string &name, uint64_t size, int
     _tag_iscsi_lun_ lun = {};
     lun.type = type;
     lun.size = size;
-    name.copy(lun.name, sizeof lun.name - 1);
-    strcpy(lun.location, (std::filesystem::path(getenv("ISCSI_HOST_STATE")).parent_path() / "volume").c_str());
+    setText(lun.name, name);
+    setText(lun.location, std::filesystem::path(getenv("ISCSI_HOST_STATE")).parent_path() / "volume");
     EXPECT_EQ(NORViSCSILunCreate(&lun), 0) << iscsi_host_last_error();
     return lun;
 }
@@ -60,8 +65,8 @@ std::string Appliance::iqn(const std::string &name)
 _tag_iscsi_target_ Appliance::request(const std::string &name)
 {
     _tag_iscsi_target_ target = {};
-    name.copy(target.name, sizeof target.name - 1);
-    iqn(name).copy(target.iqn, sizeof target.iqn - 1);
+    setText(target.name, name);
+    setText(target.iqn, iqn(name));
     target.enabled = 1;
     return target;
 }
@@ -90,7 +95,7 @@ std::vector<_tag_struct_iscsi_acl_> entry(int tid, const std::string &initiator,
 {
     _tag_struct_iscsi_acl_ entry = {};
     entry.tid = tid;
-    initiator.copy(entry.iqn, sizeof entry.iqn - 1);
+    setText(entry.iqn, initiator);
     entry.permission = permission;
     return {entry};
 }
@@ -184,16 +189,23 @@ int runTestsIsolated()
 
 } // namespace
 
+/// libiscsi 1.19 loses a few bytes when a connection breaks under one of its blocking calls.
+extern "C" __attribute__((visibility("default"))) const char *__lsan_default_suppressions()
+{
+    return "leak:libiscsi.so";
+}
+
 int main(int argc, char **argv)
 {
     const bool only_lists = argc > 1 && strstr(argv[1], "--gtest_list_tests");
     testing::InitGoogleTest(&argc, argv);
     if (only_lists)
         return RUN_ALL_TESTS();
-    if (unshare(CLONE_NEWNET | CLONE_NEWNS | CLONE_NEWPID) != 0) {
+    if (unshare(CLONE_NEWNET | CLONE_NEWNS | CLONE_NEWPID | CLONE_NEWIPC) != 0) {
         perror("these tests make namespaces, run them as root");
         return 1;
     }
+    signal(SIGPIPE, SIG_IGN); // libiscsi does not mind it
     const pid_t first = fork();
     if (first == 0) {
         norvhost::ProgramResult result;

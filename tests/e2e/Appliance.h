@@ -6,6 +6,7 @@
 #include "platform/iscsi_masking.h"
 #include "platform/iscsi_target.h"
 
+#include <cstring>
 #include <functional>
 #include <gtest/gtest.h>
 #include <string>
@@ -19,11 +20,20 @@ constexpr uint64_t MiB = 1 << 20;
 /// Initiator names.
 extern const std::string alice, bob, mallory;
 
+/// Fills a text field of a record.
+template <size_t size>
+void setText(char (&field)[size], const std::string &text)
+{
+    memset(field, 0, size);
+    text.copy(field, size - 1);
+}
+
 /// A test's appliance: empty, its service running, gone at the test's end.
 class Appliance : public testing::Test {
 protected:
     Appliance();
     ~Appliance() override;
+    void SetUp() override;
 
     std::string root; ///< the temporary folder with state, run folder and volume
 

@@ -70,7 +70,7 @@ uint64_t Initiator::capacity(int lun)
 
 bool Initiator::write(uint64_t block, uint8_t fill, int lun, uint32_t blocks)
 {
-    std::vector<unsigned char> data(blocks * block_size, fill);
+    std::vector<unsigned char> data(size_t{blocks} * block_size, fill);
     return isGood(Task(iscsi_write16_sync(context.get(), lun, block, data.data(), static_cast<uint32_t>(data.size()),
                                           block_size, 0, 0, 0, 0, 0)));
 }

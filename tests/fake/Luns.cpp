@@ -167,12 +167,14 @@ int NORViSCSILunConfigGetAll(_tag_iscsi_lun_ **luns, size_t *count)
     if (auto failure = called(__func__))
         return *failure;
     const auto &known = model().luns;
-    auto *records =
-        known.empty() ? nullptr : static_cast<_tag_iscsi_lun_ *>(malloc(known.size() * sizeof(_tag_iscsi_lun_)));
-    if (!known.empty() && !records)
+    *luns = nullptr;
+    *count = known.size();
+    if (known.empty())
+        return 0;
+    auto *records = static_cast<_tag_iscsi_lun_ *>(malloc(known.size() * sizeof(_tag_iscsi_lun_)));
+    if (!records)
         return NORV_ERR_OUT_OF_MEMORY;
     *luns = records;
-    *count = known.size();
     for (const auto &[lid, lun] : known)
         *records++ = lun.record;
     return 0;

@@ -188,7 +188,7 @@ TEST_F(LunTest, BadSizesKindsAndPlacesAreRefused)
     }
     lun = wanted("x", NORV_LUN_TYPE_ADV);
     lun.extent_size = 1000;
-    expectRefused(NORV_ERR_BAD_PARAMETER, lun);
+    expectRefused(NORV_ERR_LUN_EXTENT_SIZE, lun);
     EXPECT_TRUE(files().empty());
 }
 

@@ -50,13 +50,35 @@ struct VolumeTestNeedsRoot : VolumeTest {
     }
     void TearDown() override
     {
-        if (geteuid() == 0 && !isUnmounted())
+        closeDatabase();
+        if (isMounted())
             run({"umount", xfs});
+        EXPECT_FALSE(isMounted());
     }
-    bool isUnmounted()
+    bool isMounted()
     {
-        VolumeRow row;
-        return loadVolume(xfs, row) != 0 || checkMounted(row) != 0;
+        struct stat above, here;
+        return stat(root.c_str(), &above) == 0 && stat(xfs.c_str(), &here) == 0 && above.st_dev != here.st_dev;
+    }
+    /// Leaves no block for data and none for another file.
+    void fill()
+    {
+        const int fd = open((xfs + "/fill").c_str(), O_CREAT | O_WRONLY, 0600);
+        ASSERT_LE(0, fd);
+        off_t at = 0;
+        for (off_t length = off_t(MiB); length >= 4096;) {
+            if (fallocate(fd, 0, at, length) == 0)
+                at += length;
+            else
+                length /= 2;
+        }
+        close(fd);
+        for (int i = 0;; ++i) {
+            const int file = open((xfs + "/inode" + std::to_string(i)).c_str(), O_CREAT | O_WRONLY | O_EXCL, 0600);
+            if (file < 0)
+                break;
+            close(file);
+        }
     }
 };
 
@@ -73,11 +95,13 @@ TEST_F(VolumeTest, RegistersCanonicalFolders)
     EXPECT_EQ(NORV_ERR_LUN_LOCATION, iscsihost::addVolume(""));
     EXPECT_EQ(NORV_ERR_BAD_FILE_SYSTEM_TYPE, iscsihost::addVolume("/proc")) << iscsi_host_last_error();
 
-    const std::string deep = root + "/" + std::string(250, 'd'), odd = root + "/a\nb";
+    const std::string deep = root + "/" + std::string(250, 'd');
     std::filesystem::create_directories(deep + "/" + std::string(100, 'd'));
-    std::filesystem::create_directory(odd);
     EXPECT_EQ(NORV_ERR_LUN_LOCATION, iscsihost::addVolume(deep + "/" + std::string(100, 'd')));
-    EXPECT_EQ(NORV_ERR_LUN_LOCATION, iscsihost::addVolume(odd));
+    for (const char *odd : {"/a\nb", "/a*b", "/[a]", "/a\\b"}) {
+        std::filesystem::create_directory(root + odd);
+        EXPECT_EQ(NORV_ERR_LUN_LOCATION, iscsihost::addVolume(root + odd));
+    }
 
     const iscsihost::Volume listed = only(volume);
     EXPECT_TRUE(listed.mounted);
@@ -102,6 +126,8 @@ TEST_F(VolumeTest, CreateRefusesWhatItWouldHarm)
     std::string text;
     std::getline(std::ifstream(image), text);
     EXPECT_EQ("somebody's", text);
+    EXPECT_FALSE(exists(folder));
+    EXPECT_EQ(NORV_ERR_FILE_EXISTS, iscsihost::createVolume(root, 300 * MiB, root + "/other"));
     for (uint64_t size : {uint64_t(0), 299 * MiB, 300 * MiB + 1, UINT64_MAX})
         EXPECT_EQ(NORV_ERR_LUN_SIZE, iscsihost::createVolume(folder, size, root + "/other"));
     EXPECT_FALSE(exists(root + "/other"));
@@ -137,21 +163,7 @@ TEST_F(VolumeTestNeedsRoot, AFullDiskRefusesAndKeepsNothing)
     EXPECT_EQ(NORV_ERR_OUT_OF_SPACE, NORViSCSILunCreate(&more));
     EXPECT_EQ(NORV_ERR_OUT_OF_SPACE, update(lun, "b", 1024 * MiB));
 
-    // Not a block left, so that the allocation itself and the making of a file fail.
-    const int fd = open((xfs + "/fill").c_str(), O_CREAT | O_WRONLY, 0600);
-    ASSERT_LE(0, fd);
-    for (off_t at = 0, length = off_t(MiB); length >= 4096;) {
-        if (fallocate(fd, 0, at, length) == 0)
-            at += length;
-        else
-            length /= 2;
-    }
-    for (int i = 0; i < 100000; ++i) {
-        const int file = open((xfs + "/inode" + std::to_string(i)).c_str(), O_CREAT | O_WRONLY | O_EXCL, 0600);
-        if (file < 0)
-            break;
-        close(file);
-    }
+    fill();
     more = wanted("more", NORV_LUN_TYPE_FILE, 2 * MiB);
     EXPECT_EQ(NORV_ERR_OUT_OF_SPACE, NORViSCSILunCreate(&more)) << iscsi_host_last_error();
     more = wanted("thin");
@@ -159,12 +171,38 @@ TEST_F(VolumeTestNeedsRoot, AFullDiskRefusesAndKeepsNothing)
     EXPECT_EQ(NORV_ERR_OUT_OF_SPACE, update(lun, "b", 101 * MiB));
     EXPECT_STREQ("a", reload(lun).name);
     expectConsistent();
-    close(fd);
 
     _tag_iscsi_lun_ gone = lun;
     EXPECT_EQ(0, NORViSCSILunDelete(&gone)) << "a full disk can be emptied: " << iscsi_host_last_error();
     create("after", NORV_LUN_TYPE_FILE, 90 * MiB);
     expectConsistent();
+}
+
+TEST_F(VolumeTestNeedsRoot, AFullStateRefusesAndKeepsNothing)
+{
+    // The state alone lies on the full file system.
+    volume = root + "/vol";
+    setenv("ISCSI_HOST_STATE", (xfs + "/state").c_str(), 1);
+    closeDatabase();
+    ASSERT_EQ(0, iscsihost::addVolume(volume)) << iscsi_host_last_error();
+    const _tag_iscsi_lun_ lun = create("a");
+    fill();
+
+    int made = 0, err = 0;
+    for (; made < 1000 && !err; ++made) {
+        _tag_iscsi_lun_ more = wanted("more" + std::to_string(made));
+        err = NORViSCSILunCreate(&more);
+    }
+    EXPECT_EQ(NORV_ERR_OUT_OF_SPACE, err) << iscsi_host_last_error();
+    expectConsistent();
+    EXPECT_EQ(NORV_ERR_OUT_OF_SPACE, update(lun, std::string(150, 'b'), 8 * MiB)) << iscsi_host_last_error();
+    EXPECT_STREQ("a", reload(lun).name);
+    expectConsistent();
+
+    ASSERT_EQ(0, unlink((xfs + "/fill").c_str()));
+    create("after");
+    expectConsistent();
+    closeDatabase();
 }
 
 TEST_F(VolumeTestNeedsRoot, AReadOnlyVolumeRefusesAndChangesNothing)

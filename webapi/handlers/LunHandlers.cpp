@@ -103,7 +103,7 @@ Result listLuns(const Request &request)
     using Flags = ISCSILUNInfo::LoadFlags;
     const bool with_status = request.input["status"].asBool();
     std::vector<ISCSILUNInfo> luns;
-    if (int err = ISCSILIBLUN::ListLUN(luns, Flags::LOAD_LOCKED | Flags::LOAD_MAPPED))
+    if (int err = ISCSILIBLUN::ListLUN(luns, Flags::LOAD_MAPPED | (with_status ? Flags::LOAD_LOCKED : 0)))
         return failed(err);
     Result result;
     result.value = Json::arrayValue;
@@ -115,11 +115,12 @@ Result listLuns(const Request &request)
                 return failed(err);
             lun.toJsonFormat(out);
             addAllocatedSize(lun, record, out);
-        } else {
-            lun.toJsonFormat(out);
-            out.removeMember("status");
-            out.removeMember("allocated_size");
+            continue;
         }
+        lun.toJsonFormat(out);
+        // What was not asked for is left out rather than wrong.
+        for (const char *key : {"status", "allocated_size", "is_action_locked"})
+            out.removeMember(key);
     }
     return result;
 }

@@ -262,6 +262,9 @@ Result setMasks(const Request &request)
     Masking masking;
     if (Result bad = enter(request.input["masks"], "masks", masking); bad.code)
         return bad;
+    iscsihost::MaskingChange change;
+    if (int err = change.begin(tid))
+        return failed(err);
     return applyMasking(tid, masking);
 }
 
@@ -270,6 +273,9 @@ Result changeMasks(const Request &request)
     int tid = 0;
     if (Result bad = selectTarget(request.path.at("target"), tid); bad.code)
         return bad;
+    iscsihost::MaskingChange change;
+    if (int err = change.begin(tid))
+        return failed(err);
     Masking masking;
     if (int err = ISCSILIBTarget::GetTargetMasking(tid, masking))
         return failed(err);

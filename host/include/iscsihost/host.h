@@ -5,6 +5,7 @@
 #pragma once
 
 #include <cstdint>
+#include <memory>
 #include <string>
 #include <vector>
 
@@ -61,10 +62,10 @@ ISCSI_HOST_API int supervise();
 /// Stops the daemons. Sessions end; the state stays.
 ISCSI_HOST_API int stop();
 
-/// The address that initiators connect to; "all" for every address of the machine. Takes effect when the daemons
-/// start.
-ISCSI_HOST_API int setPortal(const std::string &address);
-ISCSI_HOST_API int getPortal(std::string &address);
+/// The IP addresses that initiators connect to, with spaces between them; "all" for every address of the machine.
+/// Takes effect when the daemons start.
+ISCSI_HOST_API int setPortal(const std::string &addresses);
+ISCSI_HOST_API int getPortal(std::string &addresses);
 
 struct UnhealthyLun {
     int lid;
@@ -82,6 +83,22 @@ struct Status {
 };
 
 ISCSI_HOST_API int status(Status &status);
+
+/// Held while a target's masking is read, changed and written back, so that two such changes at once both last.
+class ISCSI_HOST_API MaskingChange {
+public:
+    MaskingChange();
+    ~MaskingChange();
+    MaskingChange(const MaskingChange &) = delete;
+    MaskingChange &operator=(const MaskingChange &) = delete;
+
+    /// Waits for other changes of the target's masking to end. The object's end lets the next one go on.
+    int begin(int tid);
+
+private:
+    struct Lock;
+    std::unique_ptr<Lock> lock;
+};
 
 /// What the storage SDK has no call for on a snapshot, named by its UUID.
 

@@ -22,7 +22,7 @@ constexpr int daemon_timeout_ms = 2000;
 constexpr size_t learned_max = 256;
 
 /// How long a redirected initiator may take until its session shows.
-constexpr auto redirect_limit = 10s;
+constexpr auto redirect_limit = 3s;
 
 Decision refused(LoginStatus status)
 {

@@ -202,7 +202,7 @@ class AllocatedSize : public LUNState {
 protected:
     AllocatedSize()
     {
-        std::string pattern = testing::TempDir() + "/lun.XXXXXX";
+        std::string pattern = testing::TempDir() + "lun.XXXXXX";
         folder = mkdtemp(pattern.data());
         std::filesystem::create_directories(folder + "/@iSCSITrg");
         std::filesystem::create_directories(folder + "/@EP_trash");

@@ -3,8 +3,6 @@
 #include "iscsiwebapi/ISCSILUNInfo.h"
 #include "tests/unit/Library.h"
 
-#include <unistd.h>
-
 #include <fstream>
 
 namespace unit {
@@ -83,12 +81,6 @@ TEST_F(LogLineTest, HeadNamesTheFailingStep)
     while (number-- > 0)
         std::getline(source, step);
     EXPECT_NE(step.find("No LUN UUID"), std::string::npos) << step;
-}
-
-TEST_F(LogLineTest, SleepingCostsNothing)
-{
-    EXPECT_EQ(sleep(3600), 0u);
-    EXPECT_EQ(fake::secondsSlept(), 3600u);
 }
 
 } // namespace

@@ -6,7 +6,6 @@
 namespace unit {
 namespace {
 
-using ISCSI::ISCSILUNInfo;
 using ISCSI::LIB::LIBLUN::ISCSILIBLUN;
 
 class LUNOperations : public LibraryTest {
