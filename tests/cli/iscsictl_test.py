@@ -291,7 +291,7 @@ class Completion(Appliance):
         subprocess.run(["bash", "-n", self.script], check=True)
 
     def test_words_come_from_the_definitions(self):
-        self.assertEqual(self.complete(""), ["lun", "target", "completion"])
+        self.assertEqual(self.complete(""), ["lun", "snapshot", "retention", "schedule", "events", "target", "completion"])
         self.assertEqual(self.complete("lun", "un"), ["unmap", "unload"])
         self.assertEqual(self.complete("lun", "create", "--s"), ["--size"])
         self.assertEqual(self.complete("lun", "create", "--type", "t"), ["thin"])
@@ -317,11 +317,11 @@ class Manual(Appliance):
             file.write("before\n@COMMANDS@\nafter\n")
         text = self.ok("__manual", source)
         self.assertTrue(text.startswith("before\n.SS ") and text.endswith("after\n"))
-        for noun in ("lun", "target"):
+        for noun in ("lun", "snapshot", "target"):
             verbs = [line.split()[0] for line in self.ok(noun, "--help").partition("Subcommands:\n")[2].splitlines() if line]
             self.assertGreaterEqual(len(verbs), 5)
             for verb in verbs:
-                self.assertIn(f"\n.SS {noun} {verb}\n", text)
+                self.assertIn(f"\n.SS {noun} {verb}\n".replace("-", r"\-"), text)
         self.assertIn("\\fB\\-\\-chap\\-secret\\-file\\fR \\fIFILE\\fR\n", text)
 
 
