@@ -5,6 +5,8 @@
 #include "cli/Values.h"
 #include "cli/Watch.h"
 
+#include <algorithm>
+
 namespace cli {
 
 using webapi::Method;
@@ -161,8 +163,13 @@ void addDelete(Commands &commands, CLI::App &noun)
             requireTerminal();
         // All first: a deletion changes the places of the others in the list.
         std::vector<Json::Value> snapshots;
-        for (const std::string &selector : *selectors)
-            snapshots.push_back(request(Method::Get, snapshotPath(selector)));
+        for (const std::string &selector : *selectors) {
+            const Json::Value snapshot = request(Method::Get, snapshotPath(selector));
+            const bool again = std::any_of(snapshots.begin(), snapshots.end(),
+                                           [&](const Json::Value &other) { return other["uuid"] == snapshot["uuid"]; });
+            if (!again)
+                snapshots.push_back(snapshot);
+        }
         for (const Json::Value &snapshot : snapshots) {
             if (!a->yes && !confirmed("Delete snapshot " + shown(nameOf(snapshot)) + "?"))
                 continue;

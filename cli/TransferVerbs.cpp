@@ -16,6 +16,7 @@ using webapi::Method;
 namespace {
 
 constexpr char LUN_HELP[] = "Name, UUID or place in the list of the LUN";
+constexpr char SNAPSHOT_HELP[] = "LUN_NAME, UUID or place in the list of the snapshot";
 
 /// An export or an import, as the handlers tell it.
 struct Transfer {
@@ -87,7 +88,7 @@ void addExport(Commands &commands, CLI::App &noun)
         };
         run(*a, action, "Exported " + a->selector + " to " + destination);
     });
-    addPositional(verb, "SNAPSHOT", a->selector, "LUN_NAME, UUID or place in the list of the snapshot");
+    addPositional(verb, "SNAPSHOT", a->selector, SNAPSHOT_HELP);
     addPositional(verb, "DIRECTORY", *folder, "Directory for the export, made if missing");
     addWatch(verb, a->watch);
     addJson(verb, a->json);
@@ -113,14 +114,13 @@ void addImport(Commands &commands, CLI::App &noun)
     addJson(verb, a->json);
 }
 
-void addCancel(Commands &commands, CLI::App &noun, const char *name, const char *kind, const char *description,
-               Transfer (*transfer)(const std::string &))
+void addCancel(Commands &commands, CLI::App &noun, const char *name, const char *description,
+               Transfer (*transfer)(const std::string &), const char *kind, const char *kind_help)
 {
     auto a = std::make_shared<Arguments>();
     CLI::App &verb = addVerb(commands, noun, name, description,
                              [a, transfer] { request(Method::Delete, transfer(a->selector).path); });
-    addPositional(verb, kind, a->selector,
-                  std::string("Selector of the ").append(kind[0] == 'L' ? "LUN" : "snapshot").c_str());
+    addPositional(verb, kind, a->selector, kind_help);
 }
 
 void addClone(Commands &commands, CLI::App &noun)
@@ -154,10 +154,11 @@ void addTransferVerbs(Commands &commands)
     CLI::App &lun = *commands.app.get_subcommand("lun");
     addClone(commands, lun);
     addImport(commands, lun);
-    addCancel(commands, lun, "import-cancel", "LUN", "Stop the import into a LUN", importOf);
+    addCancel(commands, lun, "import-cancel", "Stop the import into a LUN", importOf, "LUN", LUN_HELP);
     CLI::App &snapshot = *commands.app.get_subcommand("snapshot");
     addExport(commands, snapshot);
-    addCancel(commands, snapshot, "export-cancel", "SNAPSHOT", "Stop the export of a snapshot", exportOf);
+    addCancel(commands, snapshot, "export-cancel", "Stop the export of a snapshot", exportOf, "SNAPSHOT",
+              SNAPSHOT_HELP);
 }
 
 } // namespace cli

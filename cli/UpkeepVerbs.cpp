@@ -198,6 +198,7 @@ void addEvents(Commands &commands)
             return printJson(events);
         printEvents(events, false);
     });
+    verb.footer("");
     addNumber(verb, "--last", a->input, "count", "How many of them (20)");
     verb.add_flag("--follow", *follow, "Go on with each new one, as one line of JSON with --json");
     addJson(verb, a->json);

@@ -157,9 +157,10 @@ int findFreeSnapshotId(int lid, int &snap_id)
 
 int findFreeLoadedNumber(int &number)
 {
-    Query query("SELECT loaded_number FROM snapshots WHERE loaded_number IS NOT NULL ORDER BY loaded_number");
+    Query query("SELECT loaded_number FROM snapshots WHERE loaded_number IS NOT NULL "
+                "UNION SELECT mapping_index FROM mappings WHERE mapping_index >= ?1 ORDER BY 1");
     int free_number = first_loaded_number;
-    if (int err = lowestFree(query, free_number))
+    if (int err = lowestFree(query.bind(first_loaded_number), free_number))
         return err;
     if (free_number > last_loaded_number)
         return fail(NORV_ERR_MAX_SNAPSHOTS, "%d snapshots are loaded: that is the most",

@@ -11,8 +11,9 @@
 
 namespace norvhost {
 
-/// LUN numbers of loaded snapshots lie behind those that LUNs can have, and end where SCSI's flat numbering does.
-constexpr int first_loaded_number = NORV_LUN_ID_MAX + 1;
+/// LUN numbers of loaded snapshots: the first ones are below 256, which every initiator reaches, and they end where
+/// SCSI's flat numbering does. LUNs get the lowest free ones from 1, and no number that a loaded snapshot has.
+constexpr int first_loaded_number = 128;
 constexpr int last_loaded_number = 0x3fff;
 
 struct SnapshotRow {
@@ -35,7 +36,8 @@ int loadSnapshotsOfLun(int lid, std::vector<SnapshotRow> &rows);
 /// The lowest number that the LUN has no snapshot under: NORV_ERR_MAX_SNAPSHOTS when there is none.
 int findFreeSnapshotId(int lid, int &snap_id);
 
-/// The lowest number that no loaded snapshot has: NORV_ERR_MAX_SNAPSHOTS when there is none.
+/// The lowest of them that neither a loaded snapshot nor a LUN in any target has: NORV_ERR_MAX_SNAPSHOTS when there is
+/// none.
 int findFreeLoadedNumber(int &number);
 
 /// NORV_ERR_SNAPSHOT_NAME when another snapshot of the LUN bears the name.

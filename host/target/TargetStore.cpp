@@ -4,6 +4,7 @@
 #include "host/state/Database.h"
 #include "host/storage/LunStore.h"
 #include "host/storage/MapFile.h"
+#include "host/storage/SnapshotStore.h"
 #include "host/target/Name.h"
 #include "platform/error.h"
 
@@ -160,8 +161,17 @@ int loadMappedLuns(int tid, std::vector<MappedLun> &luns)
         if (int err = loadLunByLid(mapping.lid, row))
             return err;
         found.push_back({mapping.lid, mapping.index, row.record.type, row.record.uuid, row.record.size,
-                         dataPath(row.record), row.loaded && !isInTrash(row.record)});
+                         dataPath(row.record), row.loaded && !isInTrash(row.record), false});
     }
+    const auto add_snapshot = [&](const SnapshotRow &row) {
+        const _tag_iscsi_snapshot_ &snapshot = row.record;
+        // Whoever writes its LUN, a snapshot is for all to read: a kind that both daemons show.
+        found.push_back({snapshot.lid, row.loaded_number, NORV_LUN_TYPE_ADV, snapshot.uuid, snapshot.total_size,
+                         snapshotDataPath(snapshot), true, true});
+        return 0;
+    };
+    if (int err = forEachLoadedSnapshot(tid, add_snapshot))
+        return err;
     luns = std::move(found);
     return 0;
 }
@@ -183,7 +193,8 @@ int insertMapping(int tid, int lid)
 {
     int index;
     {
-        Query taken("SELECT mapping_index FROM mappings WHERE tid = ?1 ORDER BY mapping_index");
+        Query taken("SELECT mapping_index FROM mappings WHERE tid = ?1 "
+                    "UNION SELECT loaded_number FROM snapshots WHERE loaded_number IS NOT NULL ORDER BY 1");
         if (int err = lowestFree(taken.bind(tid), index))
             return err;
     }

@@ -12,7 +12,7 @@
 
 namespace norvhost {
 
-/// What the target's initiators see of one LUN.
+/// What the target's initiators see of one LUN, or of one snapshot that is loaded.
 struct MappedLun {
     int lid = 0;
     int index = 0; ///< the LUN number
@@ -20,7 +20,8 @@ struct MappedLun {
     std::string uuid;
     uint64_t size = 0;
     std::string path;   ///< of the data
-    bool shown = false; ///< loaded and not in the trash
+    bool shown = false;     ///< loaded and not in the trash
+    bool read_only = false; ///< for everybody: a snapshot
 };
 
 struct Mapping {
@@ -46,11 +47,11 @@ int insertTarget(_tag_iscsi_target_ &target);
 int deleteTarget(int tid);
 int setTargetEnabled(int tid, bool enabled);
 
-/// Ascending by LUN number.
+/// Ascending by LUN number, with the loaded snapshots of these LUNs behind them.
 int loadMappedLuns(int tid, std::vector<MappedLun> &luns);
 /// Ascending by target ID.
 int loadMappingsOfLun(int lid, std::vector<Mapping> &mappings);
-/// Maps under the lowest free LUN number from 1.
+/// Maps under the lowest LUN number from 1 that neither another LUN of the target nor a loaded snapshot has.
 int insertMapping(int tid, int lid);
 /// NORV_ERR_NO_SUCH_MAPPING when there is none.
 int deleteMapping(int tid, int lid);

@@ -1,0 +1,206 @@
+/// Snapshots of a LUN that initiators use.
+#include "tests/e2e/Appliance.h"
+#include "tests/e2e/Initiator.h"
+
+#include "host/core/Process.h"
+#include "host/storage/MapFile.h"
+#include "host/target/Service.h"
+#include "iscsihost/host.h"
+#include "platform/iscsi_snapshot.h"
+
+#include <atomic>
+#include <cstring>
+#include <fcntl.h>
+#include <iscsi/scsi-lowlevel.h>
+#include <set>
+#include <thread>
+#include <unistd.h>
+
+namespace e2e {
+namespace {
+
+using namespace std::chrono_literals;
+
+class SnapshotTest : public Appliance {
+protected:
+    void SetUp() override
+    {
+        Appliance::SetUp();
+        ASSERT_EQ(iscsihost::createVolume(root + "/xfs", 300 * MiB, root + "/image"), 0) << iscsi_host_last_error();
+        store.target = createTarget("store");
+        store.lun.type = NORV_LUN_TYPE_ADV;
+        store.lun.size = 64 * MiB;
+        setText(store.lun.name, "lun");
+        setText(store.lun.location, root + "/xfs");
+        ASSERT_EQ(NORViSCSILunCreate(&store.lun), 0) << iscsi_host_last_error();
+        map(store.lun, {store.target.tid});
+        mask(store.target.tid, alice, NORV_AUTHORITY_READ_WRITE);
+        mask(store.target.tid, bob, NORV_AUTHORITY_READ);
+    }
+
+    void TearDown() override
+    {
+        EXPECT_EQ(norvhost::stopService(), 0) << iscsi_host_last_error();
+        norvhost::ProgramResult result;
+        EXPECT_EQ(norvhost::runProgram({{"umount", root + "/xfs"}, {}, 10}, result), 0);
+        EXPECT_EQ(result.status, 0) << result.errors;
+    }
+
+    _tag_iscsi_snapshot_ take(const std::string &name)
+    {
+        _tag_iscsi_snapshot_ snapshot = {};
+        setText(snapshot.name, name);
+        EXPECT_EQ(NORViSCSISnapshotCreate(&store.lun, &snapshot), 0) << iscsi_host_last_error();
+        return snapshot;
+    }
+
+    /// One extent for each 32 KiB: a clone takes milliseconds, in which a writer could slip.
+    void scatter()
+    {
+        const int fd = open(norvhost::dataPath(store.lun).c_str(), O_WRONLY | O_CLOEXEC);
+        const std::string block(4096, 's');
+        for (uint64_t at = 32768; at < store.lun.size - MiB; at += 32768)
+            ASSERT_EQ(pwrite(fd, block.data(), block.size(), static_cast<off_t>(at)), ssize_t{4096});
+        close(fd);
+    }
+
+    Store store = {};
+};
+
+/// Writes ascending numbers, each to the first block and, when that was acknowledged, to the last one.
+class OrderedWriter {
+public:
+    OrderedWriter(const std::string &target, uint64_t size) : initiator(alice), last_block(size / block_size - 1)
+    {
+        iscsi_set_noautoreconnect(initiator.get(), 1);
+        connected = initiator.logIn(target);
+        thread = std::thread([this] {
+            while (connected && !stopping && !failed && write(0, number + 1) && write(last_block, number + 1))
+                ++number;
+        });
+    }
+    ~OrderedWriter()
+    {
+        stopping = true;
+        thread.join();
+    }
+
+    std::atomic<bool> connected{false}, failed{false};
+    std::atomic<uint64_t> number{0};
+
+private:
+    bool write(uint64_t block, uint64_t value)
+    {
+        unsigned char data[block_size] = {};
+        memcpy(data, &value, sizeof value);
+        scsi_task *const task =
+            iscsi_write16_sync(initiator.get(), 1, block, data, sizeof data, block_size, 0, 0, 0, 0, 0);
+        failed = !task || task->status != SCSI_STATUS_GOOD;
+        if (task)
+            scsi_free_scsi_task(task);
+        return !failed;
+    }
+
+    Initiator initiator;
+    const uint64_t last_block;
+    std::atomic<bool> stopping{false};
+    std::thread thread;
+};
+
+uint64_t numberAt(const std::string &path, uint64_t at)
+{
+    uint64_t number = 0;
+    const int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC);
+    EXPECT_EQ(pread(fd, &number, sizeof number, static_cast<off_t>(at)), static_cast<ssize_t>(sizeof number));
+    close(fd);
+    return number;
+}
+
+TEST_F(SnapshotTest, NeverHoldsALaterWriteWithoutTheEarlierOne)
+{
+    scatter();
+    OrderedWriter writer(store.target.iqn, store.lun.size);
+    ASSERT_TRUE(writer.connected);
+    std::set<uint64_t> seen;
+    uint64_t before = 0;
+    for (int i = 0; i < 60; ++i) {
+        const uint64_t acknowledged = writer.number;
+        const _tag_iscsi_snapshot_ snapshot = take("s" + std::to_string(i));
+        const std::string path = norvhost::snapshotDataPath(snapshot);
+        const uint64_t first = numberAt(path, 0), second = numberAt(path, store.lun.size - block_size);
+        EXPECT_TRUE(first == second || first == second + 1) << first << " and " << second;
+        EXPECT_GE(second, acknowledged) << "an acknowledged write is missing";
+        EXPECT_LE(before, second);
+        before = second;
+        seen.insert(first);
+        EXPECT_EQ(NORViSCSISnapshotDelete(&snapshot, "test"), 0) << iscsi_host_last_error();
+    }
+    EXPECT_FALSE(writer.failed) << "the initiator saw a failure";
+    EXPECT_LT(30u, seen.size()) << "the writer stood still";
+}
+
+TEST_F(SnapshotTest, RestoresUnderASession)
+{
+    Initiator writer(alice), reader(bob);
+    ASSERT_TRUE(writer.logIn(store.target.iqn) && reader.logIn(store.target.iqn));
+    ASSERT_TRUE(writer.write(0, 0x11) && writer.write(100000, 0x11));
+    const _tag_iscsi_snapshot_ snapshot = take("s");
+    ASSERT_TRUE(writer.write(0, 0x22) && writer.write(50000, 0x22));
+    ASSERT_TRUE(reader.holds(0, 0x22));
+    ASSERT_EQ(NORViSCSISnapshotRestore(&snapshot, &store.lun), 0) << iscsi_host_last_error();
+    for (Initiator *session : {&writer, &reader})
+        EXPECT_TRUE(session->holds(0, 0x11) && session->holds(50000, 0) && session->holds(100000, 0x11))
+            << session->error();
+    EXPECT_TRUE(writer.write(0, 0x33)) << writer.error();
+    EXPECT_TRUE(reader.holds(0, 0x33));
+}
+
+TEST_F(SnapshotTest, ALoadedOneIsAReadOnlyUnitUntilItIsUnloaded)
+{
+    constexpr int number = 128;
+    const auto logIn = [&](Initiator &initiator) { return initiator.logIn(store.target.iqn); };
+    Initiator writer(alice);
+    ASSERT_TRUE(logIn(writer) && writer.write(0, 0x11));
+    const _tag_iscsi_snapshot_ snapshot = take("s"), other = take("t");
+    ASSERT_TRUE(writer.write(0, 0x22));
+    ASSERT_EQ(NORViSCSISnapshotLoad(&snapshot), 0) << iscsi_host_last_error();
+    ASSERT_EQ(NORViSCSISnapshotLoad(&snapshot), 0) << "loading again changes nothing";
+    ASSERT_EQ(NORViSCSISnapshotLoad(&other), 0) << iscsi_host_last_error();
+
+    const auto expectShown = [&](const std::string &name) {
+        Initiator initiator(name);
+        ASSERT_TRUE(logIn(initiator));
+        EXPECT_EQ(initiator.luns(), (std::vector<int>{1, number, number + 1}));
+        EXPECT_EQ(initiator.capacity(number), store.lun.size);
+        EXPECT_TRUE(initiator.holds(0, 0x11, number));
+        EXPECT_TRUE(initiator.holds(0, 0x22, 1));
+        EXPECT_FALSE(initiator.write(0, 0x33, number));
+        EXPECT_NE(initiator.serial(number).find(snapshot.uuid), std::string::npos);
+        EXPECT_NE(initiator.identification(number), initiator.identification(1));
+    };
+    expectShown(alice);
+    expectShown(bob);
+
+    killProcess(rw.processId());
+    ASSERT_EQ(norvhost::startService(), 0) << iscsi_host_last_error();
+    expectShown(alice);
+
+    // A second target of the LUN shows it under the same number.
+    const _tag_iscsi_target_ second = createTarget("second");
+    map(store.lun, {second.tid});
+    mask(second.tid, alice, NORV_AUTHORITY_READ_WRITE);
+    Initiator elsewhere(alice);
+    ASSERT_TRUE(elsewhere.logIn(second.iqn));
+    EXPECT_TRUE(elsewhere.holds(0, 0x11, number));
+
+    ASSERT_EQ(NORViSCSISnapshotUnload(&snapshot), 0) << iscsi_host_last_error();
+    EXPECT_EQ(elsewhere.luns(), (std::vector<int>{1, number + 1}));
+    ASSERT_EQ(NORViSCSISnapshotDelete(&other, "test"), 0) << iscsi_host_last_error();
+    EXPECT_EQ(elsewhere.luns(), std::vector<int>{1});
+    ASSERT_EQ(NORViSCSISnapshotLoad(&snapshot), 0);
+    EXPECT_EQ(unmap(store.lun, {second.tid}), 0);
+    EXPECT_TRUE(elsewhere.luns().empty());
+}
+
+} // namespace
+} // namespace e2e
