@@ -114,7 +114,9 @@ void Platform::addScheduledSnapshots(int lid)
 
 void Platform::addRetentionPolicy(int lid)
 {
-    require(iscsihost::setRetentionPolicy("Lun#", std::to_string(lid), "keep 5"), "setRetentionPolicy");
+    iscsihost::RetentionPolicy policy;
+    policy.newest = 5;
+    require(iscsihost::setRetentionPolicy(lid, policy), "setRetentionPolicy");
 }
 
 } // namespace contract
