@@ -40,7 +40,7 @@ NORV_API int NORVExtentPoolMapFileVersionInfoGet(const char *path, _tag_map_file
 NORV_API int NORVExtentPoolMapFileTotalCountGet(const char *path, uint64_t *count);
 NORV_API int NORVExtentPoolMapFileSyncedCountGet(const char *path, uint64_t *count);
 
-/// Progress of the copy that fills a map file: bytes done and bytes in all.
+/// Progress of the copy that fills a map file, or the snapshot in a folder: bytes done and bytes in all.
 NORV_API int NORViSCSIChildLunSyncProgressGet(const char *path, uint64_t *done, uint64_t *total);
 
 NORV_END_DECLS

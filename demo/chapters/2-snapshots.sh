@@ -76,9 +76,9 @@ same "what alice read from the imported LUN" "$(checksum "$COPY")" "$(checksum /
 tell "Snapshots each hour, of which the newest three stay, and one of each of seven days; a locked one always stays."
 do_it iscsictl schedule add --lun keep --every 1h
 do_it iscsictl schedule list
-do_it iscsictl retention set keep --keep 3 --daily 7
 for number in 1 2 3 4; do
     iscsictl snapshot take keep --name "hour-$number" >/dev/null
 done
-do_it iscsictl retention dry-run keep
+do_it iscsictl retention dry-run keep --keep 3 --daily 7
+do_it iscsictl retention set keep --keep 3 --daily 7
 do_it iscsictl events

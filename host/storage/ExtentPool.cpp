@@ -1,6 +1,7 @@
 #include "platform/extent_pool.h"
 
 #include "host/core/LastError.h"
+#include "host/storage/MapFile.h"
 #include "host/storage/Versions.h"
 #include "platform/error.h"
 
@@ -90,8 +91,10 @@ int NORViSCSIChildLunSyncProgressGet(const char *path, uint64_t *done, uint64_t 
 {
     if (!path || !done || !total)
         return missingArgument(__func__);
+    struct stat status;
+    const bool of_snapshot = lstat(path, &status) == 0 && S_ISDIR(status.st_mode);
     TransferCount copying;
-    if (int err = readTransferCount(path, Transfer::copying, copying))
+    if (int err = readTransferCount(of_snapshot ? snapshotDataPath(path) : path, Transfer::copying, copying))
         return err;
     *done = copying.done;
     *total = copying.total;

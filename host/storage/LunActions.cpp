@@ -63,7 +63,7 @@ int lockLun(int lid, int action, LunLock &lock, LunRow &row)
     // A failure here is no reason to refuse what can be done all the same.
     if (lock.foundUnfinished() && sweepLun(lid) != 0)
         syslog(LOG_WARNING, "left to the next sweep: %s", lastError());
-    if (sweepTransfers() != 0)
+    if (importHasProgressFile(lid) && sweepTransfers() != 0)
         syslog(LOG_WARNING, "left to the next sweep: %s", lastError());
     if (requireWhole(row, lock) != 0)
         syslog(LOG_ERR, "LUN %d: an interrupted restore is not completed yet: %s", lid, lastError());

@@ -10,6 +10,7 @@
 #include "host/storage/SnapshotFiles.h"
 #include "host/storage/SnapshotStore.h"
 #include "host/storage/Sweep.h"
+#include "host/storage/Transfers.h"
 #include "host/target/Exports.h"
 #include "platform/error.h"
 #include "platform/iscsi_lun.h"
@@ -147,8 +148,11 @@ int NORViSCSILunDelete(_tag_iscsi_lun_ *lun)
         return err;
     if (int err = removeLun(row.record.lid))
         return err;
-    for (const SnapshotRow &snapshot : snapshots)
+    forgetTransfer({row.record.lid, 0});
+    for (const SnapshotRow &snapshot : snapshots) {
+        forgetTransfer({row.record.lid, snapshot.record.snap_id});
         dropSnapshotData(snapshot.record);
+    }
     if (!isBlock(row.record.type))
         dropDataFile(dataPath(row.record));
     return 0;

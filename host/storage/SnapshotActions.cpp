@@ -11,6 +11,7 @@
 #include "host/storage/MapFile.h"
 #include "host/storage/SnapshotFiles.h"
 #include "host/storage/Sweep.h"
+#include "host/storage/Transfers.h"
 #include "host/target/Exports.h"
 #include "iscsihost/host.h"
 #include "platform/error.h"
@@ -204,6 +205,7 @@ int NORViSCSISnapshotDelete(const _tag_iscsi_snapshot_ *snapshot, const char *wh
         return err;
     if (int err = removeSnapshot(record.uuid))
         return err;
+    forgetTransfer({record.lid, record.snap_id});
     syslog(LOG_INFO, "snapshot '%s' of LUN '%s' deleted by '%.64s'", record.name, locked.lun.record.name,
            who ? who : "");
     if (locked.row.loaded_number && syncLunExports(record.lid) != 0)

@@ -1,6 +1,7 @@
 #include "host/storage/Transfers.h"
 
 #include "host/core/LastError.h"
+#include "host/core/Paths.h"
 #include "host/state/Database.h"
 #include "host/storage/ExportFolder.h"
 #include "platform/error.h"
@@ -36,6 +37,11 @@ std::string lockName(const TransferId &id)
 {
     const std::string lun = std::to_string(id.lid);
     return id.isExport() ? "export-" + lun + "-" + std::to_string(id.snap_id) : "import-" + lun;
+}
+
+std::string progressPath(const TransferId &id)
+{
+    return progressFolder() + "/" + progressFileName(id);
 }
 
 int loadTransfers(std::vector<TransferRow> &rows)
@@ -175,6 +181,16 @@ int cancelTransfer(const TransferId &id)
         return 0;
     return id.isExport() ? fail(NORV_ERR_NOT_EXPORTING, "the snapshot is not being exported")
                          : fail(NORV_ERR_NOT_IMPORTING, "nothing is being imported into the LUN");
+}
+
+bool importHasProgressFile(int lid)
+{
+    return access(progressPath({lid, 0}).c_str(), F_OK) == 0;
+}
+
+void forgetTransfer(const TransferId &id)
+{
+    unlink(progressPath(id).c_str());
 }
 
 int sweepTransfers()

@@ -51,6 +51,12 @@ int cancelTransfer(const TransferId &id);
 /// of an end a while ago.
 int sweepTransfers();
 
+/// Whether an import into the LUN left its progress file: it runs, has ended, or was killed.
+bool importHasProgressFile(int lid);
+
+/// Removes the outcome of a transfer whose LUN or snapshot goes: the next one with its number has none.
+void forgetTransfer(const TransferId &id);
+
 /// Forks a worker that runs `work` and lets go of all that it holds, of its lock last. Returns at once; when there is
 /// no worker, NORV_ERR_FORK and the work undone.
 template <class Work>

@@ -6,8 +6,23 @@
 #include <csignal>
 #include <sys/ptrace.h>
 #include <sys/wait.h>
+#include <unistd.h>
 
 namespace norvhost {
+
+StateKeeper::StateKeeper()
+    : process(inChild([] {
+          openDatabase();
+          return pause();
+      }))
+{
+}
+
+StateKeeper::~StateKeeper()
+{
+    kill(process, SIGKILL);
+    waitpid(process, nullptr, 0);
+}
 
 bool killAtSystemCall(int n, const std::function<int()> &work)
 {

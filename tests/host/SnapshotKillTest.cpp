@@ -7,6 +7,7 @@
 
 #include <csignal>
 #include <map>
+#include <memory>
 #include <poll.h>
 #include <random>
 #include <unistd.h>
@@ -19,9 +20,12 @@ struct SnapshotKillTest : SnapshotTest {
     _tag_iscsi_snapshot_ first = {}, second = {};
     std::map<std::string, size_t> digests; ///< of the snapshots' data, by UUID
 
+    std::unique_ptr<StateKeeper> keeper;
+
     /// A LUN with the data of `second`, and two snapshots.
     void prepare(uint64_t size, uint64_t distance)
     {
+        keeper = std::make_unique<StateKeeper>();
         lun = filled("a", 1, size, distance);
         first = take(lun, "first");
         writeData(dataPath(lun), 2, size, distance);
@@ -138,7 +142,7 @@ TEST_F(SnapshotKillTest, DeletingALunWithSnapshotsKilledAtEverySystemCall)
 /// Whenever it comes, in data whose clones take long enough to be cut short.
 TEST_F(SnapshotKillTest, RandomKills)
 {
-    prepare(8 * MiB, 16384);
+    prepare(4 * MiB, 8192);
     const auto busy = [this] {
         for (;;) {
             _tag_iscsi_snapshot_ snapshot = {};

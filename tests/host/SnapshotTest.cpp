@@ -7,6 +7,7 @@
 #include "host/storage/Versions.h"
 #include "host/storage/Volumes.h"
 #include "platform/core.h"
+#include "platform/extent_pool.h"
 
 #include <chrono>
 #include <cstring>
@@ -498,6 +499,11 @@ TEST_F(SnapshotTest, VersionsTravelWithTheData)
     write(path, 0, "again");
     ASSERT_EQ(0, readVersions(path, versions));
     EXPECT_NE(received, versions.current);
+
+    uint64_t done = 1, total = 1;
+    const std::string folder = snapshotFolder(snapshot);
+    EXPECT_EQ(0, NORViSCSIChildLunSyncProgressGet(folder.c_str(), &done, &total)) << iscsi_host_last_error();
+    EXPECT_EQ(0u, done + total) << "nothing was sent into it";
 }
 
 TEST_F(SnapshotTest, DataRemovedByHandIsToldAndNothingIsForgotten)

@@ -434,6 +434,12 @@ TEST_F(TransferTest, CancelAndCompletionExcludeEachOther)
     EXPECT_EQ(0, sweepTransfers());
     EXPECT_EQ("none", progress(TransferId{4, 0})) << "an old outcome goes";
     EXPECT_NE("none", progress(id));
+    const _tag_iscsi_lun_ lun = filled("a", 1);
+    take(lun, "s");
+    const _tag_iscsi_snapshot_ snapshot = take(lun, "t");
+    ASSERT_NE("none", progress(snapshot));
+    EXPECT_EQ(0, NORViSCSISnapshotDelete(&snapshot, "test")) << iscsi_host_last_error();
+    EXPECT_EQ("none", progress(snapshot)) << "the next snapshot with this number has no outcome";
 }
 
 TEST_F(TransferTest, DiskFull)
