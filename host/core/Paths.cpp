@@ -36,7 +36,7 @@ std::string progressFolder()
 int makeFolder(const std::string &path)
 {
     for (size_t slash = path.find('/', 1); slash != std::string::npos; slash = path.find('/', slash + 1))
-        mkdir(path.substr(0, slash).c_str(), 0755);
+        mkdir(path.substr(0, slash).c_str(), 0700);
     if (mkdir(path.c_str(), 0700) == 0)
         return 0;
 

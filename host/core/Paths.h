@@ -14,7 +14,8 @@ std::string runFolder();
 /// $ISCSI_HOST_PROGRESS, else /tmp/iscsi, where readers look: the progress files of exports and imports.
 std::string progressFolder();
 
-/// Makes a folder with mode 0700, its missing parents with 0755. An existing folder is left as it is.
+/// Makes a folder and its missing parents with mode 0700: a parent may be the state folder itself. An existing folder is
+/// left as it is.
 /// 0, else an error code.
 int makeFolder(const std::string &path);
 
