@@ -268,6 +268,15 @@ int setSnapshotNote(const std::string &uuid, const std::string &note)
     });
 }
 
+int snapshotLunNumber(const std::string &uuid, int &number)
+{
+    SnapshotRow row;
+    if (int err = loadSnapshotByUuid(uuid, row))
+        return err;
+    number = row.loaded_number;
+    return 0;
+}
+
 int renameSnapshot(const std::string &uuid, const std::string &name)
 {
     _tag_iscsi_snapshot_ named = {};
