@@ -39,7 +39,8 @@ int lockSnapshot(const _tag_iscsi_snapshot_ *snapshot, int action, SnapshotLock 
         return err;
     if (int err = lock.take(row.record.lid, row.record.snap_id, action))
         return err;
-    return loadSnapshotByUuid(snapshot->uuid, row);
+    const std::string uuid = row.record.uuid;
+    return loadSnapshotByUuid(uuid, row);
 }
 
 int LockedSnapshot::take(const _tag_iscsi_snapshot_ *snapshot, int action)
