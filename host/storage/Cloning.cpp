@@ -1,5 +1,6 @@
 /// The platform's making of new LUNs from snapshots and from LUNs.
 #include "host/core/LastError.h"
+#include "host/state/Fields.h"
 #include "host/storage/DataFile.h"
 #include "host/storage/FileClone.h"
 #include "host/storage/LunActions.h"
@@ -18,15 +19,17 @@ using namespace norvhost;
 
 namespace {
 
-/// What the caller's record asks for; it may hold leftovers of the LUN that it was copied from.
+/// What the caller's record asks for; the rest of it may be another LUN's, that it was copied from.
 int checkClone(const _tag_iscsi_lun_ &wanted, uint64_t size, LunRow &row)
 {
-    row.record = wanted;
-    row.record.options = 0;
-    row.record.restored_time = 0;
+    if (int err = checkTerminated(wanted))
+        return err;
+    copyText(row.record.name, wanted.name);
+    copyText(row.record.location, wanted.location);
+    row.record.extent_size = wanted.extent_size;
     row.record.size = size;
-    if (wanted.type == NORV_LUN_TYPE_SINK) // a sink is made for a peer that fills it
-        row.record.type = NORV_LUN_TYPE_ADV;
+    // A sink is made for a peer that fills it.
+    row.record.type = wanted.type == NORV_LUN_TYPE_SINK ? NORV_LUN_TYPE_ADV : wanted.type;
     if (isBlock(row.record.type))
         return fail(NORV_ERR_CLONE_BLOCK_LUN, "a block device cannot be cloned");
     if (!isSparse(row.record.type))

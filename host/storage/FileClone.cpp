@@ -17,7 +17,7 @@
 namespace norvhost {
 namespace {
 
-constexpr size_t copy_step = 1 << 20;
+constexpr size_t copy_step = 256 << 10; // larger ones do not stay in the processor's cache
 
 int fileSize(int fd, uint64_t &size)
 {
@@ -106,13 +106,13 @@ private:
 /// Copies the data between holes, and makes holes where `to`, up to its old size, may hold data.
 int copyExtents(int from, int to, uint64_t old_size, const BytesProgress &progress)
 {
-    uint64_t size, done = 0;
+    uint64_t size = 0, done = 0;
     if (int err = fileSize(from, size))
         return err;
     posix_fadvise(from, 0, 0, POSIX_FADV_SEQUENTIAL);
     WriteBehind behind(to);
     std::vector<char> buffer(copy_step);
-    for (uint64_t at = 0, begin, end; at < size; at = end) {
+    for (uint64_t at = 0, begin = 0, end = 0; at < size; at = end) {
         if (int err = nextData(from, at, size, begin, end))
             return err;
         if (int err = punchHole(to, at, std::min(begin, old_size)))
@@ -168,11 +168,11 @@ int shareBlocks(int from, int to, bool &shared)
 
 int countData(int fd, uint64_t &bytes)
 {
-    uint64_t size;
+    uint64_t size = 0;
     if (int err = fileSize(fd, size))
         return err;
     bytes = 0;
-    for (uint64_t at = 0, begin, end; at < size; at = end) {
+    for (uint64_t at = 0, begin = 0, end = 0; at < size; at = end) {
         if (int err = nextData(fd, at, size, begin, end))
             return err;
         bytes += end - begin;
@@ -187,7 +187,7 @@ int copyData(int from, int to, const BytesProgress &progress)
 
 int copySparsely(int from, int to, const CopyProgress &progress)
 {
-    uint64_t size, target_size, total;
+    uint64_t size = 0, target_size = 0, total = 0;
     if (int err = fileSize(from, size))
         return err;
     if (int err = fileSize(to, target_size))
@@ -202,12 +202,12 @@ int copySparsely(int from, int to, const CopyProgress &progress)
 
 int cloneLunData(const LunRow &lun, int from, int to, const CopyProgress &progress)
 {
-    bool shared;
+    bool shared = false;
     if (int err = shareBlocks(from, to, shared))
         return err;
     if (shared)
         return 0;
-    bool in_use;
+    bool in_use = true;
     if (int err = isInUse(lun, in_use))
         return err;
     if (in_use)

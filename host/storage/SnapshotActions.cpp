@@ -39,7 +39,8 @@ int lockSnapshot(const _tag_iscsi_snapshot_ *snapshot, int action, SnapshotLock 
         return err;
     if (int err = lock.take(row.record.lid, row.record.snap_id, action))
         return err;
-    return loadSnapshotByUuid(snapshot->uuid, row);
+    const std::string uuid = row.record.uuid;
+    return loadSnapshotByUuid(uuid, row);
 }
 
 int LockedSnapshot::take(const _tag_iscsi_snapshot_ *snapshot, int action)
@@ -266,6 +267,15 @@ int setSnapshotNote(const std::string &uuid, const std::string &note)
         copyText(row.record.desc, note);
         return 0;
     });
+}
+
+int snapshotLunNumber(const std::string &uuid, int &number)
+{
+    SnapshotRow row;
+    if (int err = loadSnapshotByUuid(uuid, row))
+        return err;
+    number = row.loaded_number;
+    return 0;
 }
 
 int renameSnapshot(const std::string &uuid, const std::string &name)

@@ -108,6 +108,9 @@ ISCSI_HOST_API int setSnapshotUserLock(const std::string &uuid, bool locked);
 /// At most 1023 bytes.
 ISCSI_HOST_API int setSnapshotNote(const std::string &uuid, const std::string &note);
 
+/// The LUN number under which a loaded snapshot is read in every target of its LUN; 0 when it is not loaded.
+ISCSI_HOST_API int snapshotLunNumber(const std::string &uuid, int &number);
+
 /// A name that is free on the LUN, of the characters that LUN names may have.
 ISCSI_HOST_API int renameSnapshot(const std::string &uuid, const std::string &name);
 
