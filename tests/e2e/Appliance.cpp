@@ -25,7 +25,7 @@ const norvhost::Tgtd Appliance::rw(norvhost::Access::read_write), Appliance::ro(
 
 Appliance::Appliance()
 {
-    char folder[] = "/tmp/e2e-XXXXXX";
+    char folder[] = "/mnt/e2e-XXXXXX";
     root = mkdtemp(folder);
     setenv("ISCSI_HOST_STATE", (root + "/state").c_str(), 1);
     setenv("ISCSI_HOST_PORTALD", PORTALD_PATH, 1);
@@ -211,7 +211,7 @@ int main(int argc, char **argv)
         norvhost::ProgramResult result;
         for (const std::vector<std::string> &command : {std::vector<std::string>{"ip", "link", "set", "lo", "up"},
                                                         {"mount", "--make-rprivate", "/"},
-                                                        {"mount", "-t", "tmpfs", "tmpfs", "/tmp"},
+                                                        {"mount", "-t", "tmpfs", "tmpfs", "/mnt"},
                                                         {"mount", "-t", "proc", "proc", "/proc"}})
             if (norvhost::runProgram({command, {}, 10}, result) || result.status != 0) {
                 fprintf(stderr, "%s failed: %s\n", command[0].c_str(), result.errors.c_str());
