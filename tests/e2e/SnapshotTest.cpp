@@ -30,8 +30,8 @@ protected:
         store.target = createTarget("store");
         store.lun.type = NORV_LUN_TYPE_ADV;
         store.lun.size = 64 * MiB;
-        setText(store.lun.name, "lun");
-        setText(store.lun.location, root + "/xfs");
+        snprintf(store.lun.name, sizeof store.lun.name, "lun");
+        snprintf(store.lun.location, sizeof store.lun.location, "%s/xfs", root.c_str());
         ASSERT_EQ(NORViSCSILunCreate(&store.lun), 0) << iscsi_host_last_error();
         map(store.lun, {store.target.tid});
         mask(store.target.tid, alice, NORV_AUTHORITY_READ_WRITE);
@@ -49,7 +49,7 @@ protected:
     _tag_iscsi_snapshot_ take(const std::string &name)
     {
         _tag_iscsi_snapshot_ snapshot = {};
-        setText(snapshot.name, name);
+        snprintf(snapshot.name, sizeof snapshot.name, "%s", name.c_str());
         EXPECT_EQ(NORViSCSISnapshotCreate(&store.lun, &snapshot), 0) << iscsi_host_last_error();
         return snapshot;
     }

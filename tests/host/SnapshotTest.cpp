@@ -596,10 +596,62 @@ TEST_F(SnapshotTest, OfTwoRestoresAtOnceTheSecondIsRefused)
     expectConsistent();
 }
 
-TEST_F(SnapshotTest, AFullDiskRefusesAndKeepsNothing)
+TEST_F(SnapshotTest, AnInterruptedRestoreIsCompletedByWhoeverComesNext)
 {
     const _tag_iscsi_lun_ lun = filled("a", 1);
     const _tag_iscsi_snapshot_ snapshot = take(lun, "s");
+    const size_t whole = digest(dataPath(lun));
+    const auto interrupt = [&] {
+        ASSERT_EQ(0, markRestore(lun.lid, snapshot.uuid));
+        writeData(dataPath(lun), 7, 2 * MiB);
+    };
+    _tag_iscsi_lun_ found, *all = nullptr;
+    size_t count;
+    iscsihost::SweepReport report;
+    const std::vector<std::function<int()>> ways = {
+        [&] { return NORViSCSILunConfigGetByUUID(lun.uuid, &found, 0); },
+        [&] { return NORViSCSILunGetByLunId(lun.lid, &found); },
+        [&] { return NORViSCSILunGetByLunName("a", &found); },
+        [&] { return NORViSCSILunConfigGetAll(&all, &count); },
+        [&] { return iscsihost::sweep(report); },
+        [&] { return update(lun, "a", lun.size); },
+        [&] { return tryTake(lun, "t"); },
+        [&] { return cloneLun(lun, "clone", found); },
+    };
+    for (size_t i = 0; i < ways.size(); ++i) {
+        SCOPED_TRACE(i);
+        interrupt();
+        EXPECT_EQ(0, ways[i]()) << iscsi_host_last_error();
+        EXPECT_EQ(whole, digest(dataPath(lun)));
+    }
+    free(all);
+    EXPECT_EQ(whole, digest(snapshotDataPath(list()[1]))) << "not of the half restored LUN";
+    EXPECT_EQ(whole, digest(dataPath(found)));
+
+    // An action that holds the LUN may be the restore itself.
+    interrupt();
+    {
+        LunLock busy;
+        ASSERT_EQ(0, busy.take(lun.lid, NORV_LUN_RESTORING));
+        EXPECT_NE(whole, digest(dataPath(reload(lun))));
+    }
+    // Where the snapshot is lost, the LUN can be looked at, set back to another one and deleted; not copied.
+    const std::string folder = snapshotFolder(snapshot), away = volume + "/away";
+    ASSERT_EQ(0, rename(folder.c_str(), away.c_str()));
+    EXPECT_NE(whole, digest(dataPath(reload(lun))));
+    EXPECT_EQ(NORV_ERR_FILE_NOT_FOUND, tryTake(lun, "u"));
+    EXPECT_EQ(NORV_ERR_FILE_NOT_FOUND, cloneLun(lun, "copy", found));
+    EXPECT_EQ(NORV_ERR_SNAPSHOT_LOCKED, NORViSCSISnapshotDelete(&snapshot, "test"));
+    const _tag_iscsi_snapshot_ other = list()[1];
+    EXPECT_EQ(0, NORViSCSISnapshotRestore(&other, &lun)) << iscsi_host_last_error();
+    EXPECT_EQ(0, NORViSCSISnapshotDelete(&snapshot, "test")) << iscsi_host_last_error();
+    expectConsistent();
+}
+
+TEST_F(SnapshotTest, AFullDiskRefusesAndKeepsNothing)
+{
+    const _tag_iscsi_lun_ lun = filled("a", 1);
+    const _tag_iscsi_snapshot_ snapshot = take(lun, "s"), unwanted = take(lun, "t");
     const size_t before = digest(dataPath(lun));
     const int fd = open((volume + "/fill").c_str(), O_CREAT | O_WRONLY, 0600);
     for (off_t at = 0, length = off_t(MiB); length >= 4096;)
@@ -619,8 +671,13 @@ TEST_F(SnapshotTest, AFullDiskRefusesAndKeepsNothing)
     EXPECT_EQ(NORV_ERR_OUT_OF_SPACE, cloneLun(lun, "clone", clone)) << iscsi_host_last_error();
     EXPECT_EQ(NORV_ERR_OUT_OF_SPACE, cloneSnapshot(snapshot, "clone", clone)) << iscsi_host_last_error();
     EXPECT_EQ(before, digest(dataPath(lun)));
+    const int restored = NORViSCSISnapshotRestore(&snapshot, &lun);
+    EXPECT_TRUE(restored == 0 || restored == NORV_ERR_OUT_OF_SPACE) << restored;
     expectConsistent();
-    EXPECT_EQ(0, NORViSCSISnapshotDelete(&snapshot, "test")) << "a full disk can be emptied";
+    EXPECT_EQ(0, NORViSCSISnapshotDelete(&unwanted, "test")) << "a full disk can be emptied";
+    ASSERT_EQ(0, unlink((volume + "/fill").c_str()));
+    EXPECT_EQ(before, digest(dataPath(reload(lun)))) << "begun means done once there is space";
+    EXPECT_EQ(0, NORViSCSISnapshotDelete(&snapshot, "test")) << iscsi_host_last_error();
     expectConsistent();
 }
 
