@@ -421,9 +421,9 @@ int Reconciler::createUnit(int tid, const MappedLun &lun)
     const auto index = static_cast<uint64_t>(lun.index);
     // In one request with the path last: it is never there in another state than the one wanted.
     const std::string settings = std::string("removable=0,vendor_id=NORV,product_id=iSCSI Storage,readonly=") +
-                                 (lun.read_only || daemon.access() == Access::read ? "1" : "0") + ",scsi_id=" + scsiId(lun) +
-                                 ",scsi_sn=" + lun.uuid + ",thin_provisioning=" + (isThin(lun) ? "1" : "0") +
-                                 ",path=" + exportLink(lun);
+                                 (lun.read_only || daemon.access() == Access::read ? "1" : "0") +
+                                 ",scsi_id=" + scsiId(lun) + ",scsi_sn=" + lun.uuid +
+                                 ",thin_provisioning=" + (isThin(lun) ? "1" : "0") + ",path=" + exportLink(lun);
     if (int err = daemon.createUnit(tid, index))
         return err;
     return daemon.updateUnit(tid, index, settings);

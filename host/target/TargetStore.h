@@ -19,7 +19,7 @@ struct MappedLun {
     int type = 0;
     std::string uuid;
     uint64_t size = 0;
-    std::string path;   ///< of the data
+    std::string path;       ///< of the data
     bool shown = false;     ///< loaded and not in the trash
     bool read_only = false; ///< for everybody: a snapshot
 };
