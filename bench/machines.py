@@ -47,7 +47,9 @@ class PlainTgtd:
         self.environment = dict(os.environ, TGT_IPC_SOCKET="/run/plain-tgtd.sock")
         self.daemon = subprocess.Popen(
             ["tgtd", "-f", "-t", "2", "--iscsi", f"portal={ADDRESS}:{PLAIN_PORT}"],
-            env=self.environment, stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL)
+            env=self.environment, stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL,
+            # Ours is in a session of its own: the scheduler shares the processor between sessions.
+            start_new_session=True)
         for _ in range(100):
             if subprocess.run(["tgtadm", "--op", "show", "--mode", "sys"], env=self.environment,
                               stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL).returncode == 0:
