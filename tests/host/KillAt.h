@@ -18,7 +18,8 @@ private:
     pid_t process;
 };
 
-/// Kills a process of its own before the n-th system call of the work; false when the work ended before.
+/// Kills a process of its own before the n-th system call of the work that may change something; false when the work
+/// ended before.
 bool killAtSystemCall(int n, const std::function<int()> &work);
 
 } // namespace norvhost
