@@ -4,11 +4,13 @@
 #include "platform/event_log.h"
 #include "tests/fake/Script.h"
 
+#include <fcntl.h>
 #include <strings.h>
 #include <sys/prctl.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <cerrno>
 #include <cstdio>
 #include <cstdlib>
 #include <fstream>
@@ -60,8 +62,28 @@ int fake::pushText(NLIBC_SZ_LIST &list, const std::string &text)
     return list.texts[list.count] ? ++list.count : -1;
 }
 
+namespace {
+
+/// A pipe whose writing end every detached child holds, children of children too: it ends with the last of them.
+int alive[2] = {-1, -1};
+
+void waitUntilNoneIsAlive()
+{
+    if (alive[0] < 0)
+        return;
+    close(alive[1]);
+    char byte;
+    while (read(alive[0], &byte, 1) < 0 && errno == EINTR) {
+    }
+    close(alive[0]);
+    alive[0] = alive[1] = -1;
+}
+
+} // namespace
+
 std::vector<int> fake::waitForChildren()
 {
+    waitUntilNoneIsAlive();
     std::vector<int> statuses;
     int status = 0;
     while (waitpid(-1, &status, 0) > 0)
@@ -86,7 +108,9 @@ int NLIBCProcForkChildNoWait()
 {
     if (auto failure = called(__func__))
         return *failure;
-    prctl(PR_SET_CHILD_SUBREAPER, 1); // children of children become ours to wait for
+    prctl(PR_SET_CHILD_SUBREAPER, 1); // children of children become ours, and their exit statuses too
+    if (alive[0] < 0 && pipe2(alive, O_CLOEXEC) != 0)
+        return -1;
     return fork();
 }
 
