@@ -4,6 +4,7 @@
 #include "host/core/LastError.h"
 #include "host/core/Paths.h"
 #include "host/core/Process.h"
+#include "host/storage/Restore.h"
 #include "host/target/ExportLinks.h"
 #include "host/target/Portals.h"
 #include "host/target/ProcessLock.h"
@@ -41,7 +42,7 @@ using namespace std::chrono_literals;
 
 constexpr auto start_limit = 10s;
 constexpr auto stop_limit = 5s;
-constexpr auto supervise_interval = 5s, retry_interval = 1s;
+constexpr auto supervise_interval = 5s, retry_interval = 1s, mend_interval = 30s;
 
 constexpr const char *tgtd_program = "/usr/sbin/tgtd";
 
@@ -329,9 +330,15 @@ int superviseService()
 
     if (int err = startService())
         return err;
+    auto next_mend = std::chrono::steady_clock::now();
     do {
         if (int err = startMissing())
             syslog(LOG_ERR, "the iSCSI service is not complete (%d): %s", err, lastError());
+        // Initiators are not to work for long on a LUN whose restore was cut short. mendRestores() logs its failures.
+        if (std::chrono::steady_clock::now() >= next_mend) {
+            mendRestores();
+            next_mend = std::chrono::steady_clock::now() + mend_interval;
+        }
         cutMessages();
         while (waitpid(-1, nullptr, WNOHANG) > 0)
             ;

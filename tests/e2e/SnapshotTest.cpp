@@ -3,12 +3,15 @@
 #include "tests/e2e/Initiator.h"
 
 #include "host/core/Process.h"
+#include "host/storage/LunStore.h"
 #include "host/storage/MapFile.h"
 #include "host/target/Service.h"
+#include "host/target/Wait.h"
 #include "iscsihost/host.h"
 #include "platform/iscsi_snapshot.h"
 
 #include <atomic>
+#include <csignal>
 #include <cstring>
 #include <fcntl.h>
 #include <iscsi/scsi-lowlevel.h>
@@ -153,6 +156,20 @@ TEST_F(SnapshotTest, RestoresUnderASession)
             << session->error();
     EXPECT_TRUE(writer.write(0, 0x33)) << writer.error();
     EXPECT_TRUE(reader.holds(0, 0x33));
+}
+
+TEST_F(SnapshotTest, TheSupervisorCompletesARestoreThatWasCutShort)
+{
+    Initiator writer(alice);
+    ASSERT_TRUE(writer.logIn(store.target.iqn) && writer.write(0, 0x11));
+    const _tag_iscsi_snapshot_ snapshot = take("s");
+    ASSERT_TRUE(writer.write(0, 0x22));
+    ASSERT_EQ(norvhost::markRestore(store.lun.lid, snapshot.uuid), 0);
+    ASSERT_TRUE(writer.holds(0, 0x22)) << "the service itself looks for nothing";
+    const pid_t supervisor = inChild([] { return norvhost::superviseService(); });
+    EXPECT_TRUE(norvhost::waitFor(10s, [&] { return writer.holds(0, 0x11); }));
+    kill(supervisor, SIGTERM);
+    EXPECT_EQ(waitForChild(supervisor), 0);
 }
 
 TEST_F(SnapshotTest, ALoadedOneIsAReadOnlyUnitUntilItIsUnloaded)
