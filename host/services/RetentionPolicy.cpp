@@ -43,12 +43,12 @@ int readRule(const std::string &key, const Json::Value &value, RetentionPolicy &
 int64_t hourOf(int64_t time)
 {
     const tm local = localTime(time);
-    return time - local.tm_min * 60 - local.tm_sec;
+    return time - local.tm_min * int64_t(60) - local.tm_sec;
 }
 
 int64_t dayOf(int64_t time)
 {
-    constexpr int64_t seconds = 24 * 60 * 60;
+    constexpr int64_t seconds = 86400;
     const int64_t local = time + localTime(time).tm_gmtoff;
     return local / seconds - (local % seconds < 0 ? 1 : 0);
 }

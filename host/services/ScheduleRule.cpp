@@ -16,7 +16,7 @@ namespace {
 constexpr int64_t minute = 60, hour = 60 * minute, day = 24 * hour;
 constexpr int64_t longest_period = 366 * day;
 /// 29 February can be eight years away.
-constexpr int64_t search_limit = 9 * 366 * day;
+constexpr int64_t search_limit = 9 * longest_period;
 
 const struct {
     const char *word, *fields;

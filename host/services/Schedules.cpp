@@ -138,7 +138,7 @@ int claimDueSchedules(int64_t now, std::vector<iscsihost::Schedule> &due)
     if (int err = loadSnapshotSchedules(schedules))
         return err;
     for (iscsihost::Schedule &schedule : schedules) {
-        int64_t next;
+        int64_t next = 0;
         if (parsedNextRun(schedule, now, next) != 0) {
             syslog(LOG_WARNING, "schedule %lld: %s", static_cast<long long>(schedule.id), lastError());
             continue;

@@ -121,7 +121,7 @@ int openFile(const FileDescriptor &folder, const char *name, FileDescriptor &fil
 int readFile(const FileDescriptor &folder, const char *name, void *data, size_t size)
 {
     FileDescriptor file;
-    uint64_t found;
+    uint64_t found = 0;
     if (int err = openFile(folder, name, file, found))
         return err;
     if (found != size)
@@ -151,7 +151,7 @@ bool ends(const char (&text)[size])
 
 int readRecord(const FileDescriptor &folder, _tag_iscsi_export_config_ &config)
 {
-    _tag_iscsi_export_config_ read;
+    _tag_iscsi_export_config_ read = {};
     if (int err = readFile(folder, record_name, &read, sizeof read))
         return err;
     if (!isUuid(read.reserved_0) || !ends(read.desc) || !ends(read.taken_by) || read.app_consistent > 1 ||
@@ -179,7 +179,7 @@ int readFacts(const FileDescriptor &folder, ExportFacts &facts)
 {
     constexpr uint64_t largest = 4096;
     FileDescriptor file;
-    uint64_t size;
+    uint64_t size = 0;
     if (int err = openFile(folder, facts_name, file, size))
         return err;
     if (size > largest)
@@ -290,14 +290,14 @@ int readExportRecord(const std::string &path, _tag_iscsi_export_config_ &config)
 int openExport(const std::string &path, ExportFacts &facts, FileDescriptor &data)
 {
     FileDescriptor folder;
-    _tag_iscsi_export_config_ config;
+    _tag_iscsi_export_config_ config = {};
     if (int err = openFolder(path, folder))
         return err;
     if (int err = readRecord(folder, config))
         return err;
     if (int err = readFacts(folder, facts))
         return err;
-    uint64_t size;
+    uint64_t size = 0;
     if (int err = openFile(folder, data_name, data, size))
         return err;
     if (size != facts.size)

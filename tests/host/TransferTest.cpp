@@ -1,4 +1,5 @@
 /// Exports and imports. Their workers are processes of their own, which the tests hold, look at and kill.
+#include "KillAt.h"
 #include "SnapshotTest.h"
 
 #include "host/state/Database.h"
@@ -12,7 +13,6 @@
 #include <cstring>
 #include <filesystem>
 #include <fstream>
-#include <poll.h>
 #include <random>
 #include <sys/prctl.h>
 #include <sys/stat.h>
@@ -102,22 +102,38 @@ struct TransferTest : SnapshotTest {
         return pid;
     }
 
-    /// Starts an export of a lot of data and stops its worker on the way.
-    pid_t heldExport(const _tag_iscsi_snapshot_ &snapshot, const std::string &folder)
+    /// Starts a transfer of a lot of data and holds its worker on the way; 0 when it always ended before.
+    pid_t hold(const std::function<int()> &start, const std::function<bool()> &ended)
     {
-        for (int attempt = 0; attempt < 20; ++attempt) {
-            EXPECT_EQ(0, startExport(snapshot, folder)) << iscsi_host_last_error();
+        for (int attempt = 0; attempt < 50; ++attempt) {
+            EXPECT_EQ(0, start()) << iscsi_host_last_error();
             const pid_t pid = worker();
-            if (pid && kill(pid, SIGSTOP) == 0 && !exists(folder + "/export.record"))
+            if (pid && kill(pid, SIGSTOP) == 0 && !ended())
                 return pid;
             if (pid)
                 kill(pid, SIGCONT);
-            waitFor(snapshot);
+            while (worker())
+                usleep(1000);
+        }
+        ADD_FAILURE() << "the worker was never found before its end";
+        return 0;
+    }
+    pid_t heldExport(const _tag_iscsi_snapshot_ &snapshot, const std::string &folder)
+    {
+        const bool was_there = exists(folder);
+        const auto start = [&] {
             for (const char *name : {"export.record", "export.lun", "export.data"})
                 fs::remove(folder + "/" + name);
-        }
-        ADD_FAILURE() << "the export always ended before its worker was found";
-        return 0;
+            if (!was_there)
+                fs::remove(folder);
+            return startExport(snapshot, folder);
+        };
+        return hold(start, [&] { return exists(folder + "/export.record"); });
+    }
+    pid_t heldImport(const _tag_iscsi_lun_ &lun, const std::string &folder)
+    {
+        return hold([&] { return NORViSCSILunImport(&lun, folder.c_str()); },
+                    [&] { return progress(lun).rfind("0 ", 0) == 0; });
     }
     void goOn(pid_t pid) { EXPECT_TRUE(pid && kill(pid, SIGCONT) == 0); }
 
@@ -384,11 +400,12 @@ TEST_F(TransferTest, CancelStopsAndLeavesNothing)
     EXPECT_EQ(digest(snapshotDataPath(snapshot)), digest(folder + "/export.data"));
 
     const _tag_iscsi_lun_ target = filled("target", 2, much);
+    const pid_t importing = heldImport(target, folder);
     const size_t before = digest(dataPath(target));
-    ASSERT_EQ(0, NORViSCSILunImport(&target, folder.c_str())) << iscsi_host_last_error();
     EXPECT_EQ(0u, progress(target).find("18990591 ")) << progress(target);
     EXPECT_EQ(NORV_ERR_LUN_LOCKED, NORViSCSILunImport(&target, folder.c_str()));
     EXPECT_EQ(0, NORViSCSILunImportCancel(&target)) << iscsi_host_last_error();
+    goOn(importing);
     waitFor(target);
     EXPECT_EQ("none", progress(target));
     EXPECT_EQ(before, digest(dataPath(target)));
@@ -488,19 +505,21 @@ TEST_F(TransferTest, KilledWorkersLeaveNothingThatTheNextCommandDoesNotPutRight)
 
     std::mt19937 random(std::random_device{}());
     int interrupted = 0;
-    for (int round = 0; round < 44 && !HasFailure(); ++round) {
+    unsigned longest_us = 10000; // finds the time that a worker takes
+    for (int round = 0; interrupted < 40 && round < 400 && !HasFailure(); ++round) {
         SCOPED_TRACE("round " + std::to_string(round));
         const bool exports = round % 2 == 0;
-        ASSERT_EQ(0, exports ? startExport(snapshot, folder) : NORViSCSILunImport(&target, source.c_str()))
-            << iscsi_host_last_error();
-        poll(nullptr, 0, static_cast<int>(random() % 25));
-        const pid_t pid = worker();
-        if (pid)
-            kill(pid, SIGKILL);
+        const pid_t pid = exports ? heldExport(snapshot, folder) : heldImport(target, source);
+        goOn(pid);
+        usleep(static_cast<useconds_t>(random() % longest_us));
+        kill(pid, SIGKILL);
         waitFor(snapshot);
         waitFor(target);
+        const bool was_interrupted =
+            exports ? !exists(folder + "/export.record") : progress(target).rfind("0 ", 0) != 0;
+        interrupted += was_interrupted;
+        longest_us = std::max(100u, longest_us * (was_interrupted ? 11 : 9) / 10);
         if (exports) {
-            interrupted += !exists(folder + "/export.record");
             EXPECT_EQ(NORV_ERR_NOT_EXPORTING, NORViSCSISnapshotExportCancel(&snapshot)) << "a next command";
             EXPECT_EQ(exists(folder), exists(folder + "/export.record"));
             EXPECT_EQ("none", progress(snapshot));
@@ -509,7 +528,6 @@ TEST_F(TransferTest, KilledWorkersLeaveNothingThatTheNextCommandDoesNotPutRight)
             }
             fs::remove_all(folder);
         } else {
-            interrupted += progress(target).find("0 ") != 0;
             EXPECT_EQ(0, update(target, "target", lun_size)) << iscsi_host_last_error();
             const size_t now = digest(dataPath(target));
             EXPECT_TRUE(now == old || now == exported);
@@ -521,6 +539,35 @@ TEST_F(TransferTest, KilledWorkersLeaveNothingThatTheNextCommandDoesNotPutRight)
     exportTo(snapshot, folder);
     importInto(target, folder);
     EXPECT_EQ(exported, digest(dataPath(target)));
+}
+
+/// The caller is killed while it prepares, so that there is a worker already or never will be.
+TEST_F(TransferTest, CallersKilledAtEverySystemCall)
+{
+    const _tag_iscsi_lun_ lun = filled("a", 1, MiB);
+    const _tag_iscsi_snapshot_ snapshot = take(lun, "s");
+    const std::string source = elsewhere("source"), folder = elsewhere("out");
+    exportTo(snapshot, source);
+    for (const bool exports : {true, false}) {
+        int n = 0;
+        for (bool killed = true; killed && !HasFailure(); ++n) {
+            SCOPED_TRACE((exports ? "export" : "import") + (" killed before call " + std::to_string(n)));
+            closeDatabase();
+            killed = killAtSystemCall(
+                n, [&] { return exports ? startExport(snapshot, folder) : NORViSCSILunImport(&lun, source.c_str()); });
+            waitFor(snapshot);
+            waitFor(lun);
+            EXPECT_EQ(exports ? NORV_ERR_NOT_EXPORTING : NORV_ERR_NOT_IMPORTING,
+                      exports ? NORViSCSISnapshotExportCancel(&snapshot) : NORViSCSILunImportCancel(&lun));
+            EXPECT_EQ("none", progress(snapshot));
+            EXPECT_EQ(std::string::npos, progress(lun).find("18990591")) << progress(lun);
+            EXPECT_TRUE(!exists(folder) || exists(folder + "/export.record") || fs::is_empty(folder));
+            EXPECT_EQ(digest(snapshotDataPath(snapshot)), digest(dataPath(lun)));
+            expectConsistent();
+            fs::remove_all(folder);
+        }
+        EXPECT_LT(50, n) << "it was not followed";
+    }
 }
 
 /// The boot sweep does it where no next command comes, and touches nothing else.
