@@ -168,13 +168,13 @@ NORV_API int NORViSCSILunWaitUntilUnlock(const _tag_iscsi_lun_ *lun, int limit);
 NORV_API int NORViSCSISnapshotWaitUntilUnlock(const _tag_iscsi_snapshot_ *snapshot, int limit);
 
 /// Starts copying the snapshot into the directory `destination`; the snapshot stays locked, and its
-/// progress file exists, until done; a failure's code can be read there for a while longer. Cancelling ends the copy and
-/// removes what it made.
+/// progress file exists, until done; a failure's code can be read there for a while longer. Cancelling ends the copy
+/// and removes what it made.
 NORV_API int NORViSCSISnapshotExport(const _tag_iscsi_snapshot_ *snapshot, const char *destination);
 NORV_API int NORViSCSISnapshotExportCancel(const _tag_iscsi_snapshot_ *snapshot);
 
-/// Starts copying the export directory `source` into the LUN, which stays locked until done. How it ended can be read in
-/// its progress file for a while longer.
+/// Starts copying the export directory `source` into the LUN, which stays locked until done. How it ended can be read
+/// in its progress file for a while longer.
 NORV_API int NORViSCSILunImport(const _tag_iscsi_lun_ *lun, const char *source);
 NORV_API int NORViSCSILunImportCancel(const _tag_iscsi_lun_ *lun);
 
