@@ -134,7 +134,7 @@ int NORVRETAINERiSCSIRetentionTargetGet(const char *key, _tag_retention_target_ 
 {
     if (!targets)
         return fail(NORV_ERR_NULL_POINTER, "no place for a list of snapshots");
-    int lid;
+    int lid = 0;
     if (int err = parseLunKey(key, lid))
         return err;
     std::vector<Snapshot> snapshots;
