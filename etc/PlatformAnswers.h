@@ -52,6 +52,11 @@ struct FreeTextList {
 };
 using TextList = std::unique_ptr<NLIBC_SZ_LIST, FreeTextList>;
 
+struct FreeTextHash {
+    void operator()(NLIBC_SZ_HASH *hash) const { NLIBCSzHashFree(hash); }
+};
+using TextHash = std::unique_ptr<NLIBC_SZ_HASH, FreeTextHash>;
+
 /// NORViSCSIConfGet with an owned answer.
 inline int queryConf(const _tag_iscsi_conf_query_ &query, Conf &out)
 {
