@@ -4,9 +4,11 @@
 #include "platform/iscsi_config.h"
 #include "platform/iscsi_lun.h"
 #include "platform/iscsi_snapshot.h"
+#include "platform/replication.h"
 
 #include <cstdlib>
 #include <memory>
+#include <search.h>
 
 namespace ISCSI {
 
@@ -44,6 +46,31 @@ struct SnapshotRecords {
             (record->next ? record->next->previous : head.last) = nullptr;
         }
         return SnapshotRecord(record);
+    }
+};
+
+using TaskRecord = std::unique_ptr<_tag_iscsi_task_, FreeList>;
+
+/// A queue of task records, given up record by record.
+struct TaskRecords {
+    _tag_iscsi_task_ head{};
+
+    TaskRecords() = default;
+    TaskRecords(const TaskRecords &) = delete;
+    TaskRecords &operator=(const TaskRecords &) = delete;
+    ~TaskRecords()
+    {
+        while (takeFirst()) {
+        }
+    }
+
+    /// Unlinks the first record; null at the end of the queue.
+    TaskRecord takeFirst()
+    {
+        _tag_iscsi_task_ *record = head.forward;
+        if (record)
+            remque(record);
+        return TaskRecord(record);
     }
 };
 

@@ -32,6 +32,10 @@ NORV_API int NLIBCSzListPush(NLIBC_SZ_LIST *list, const char *text);
 /// The text at `index`, owned by the list; null when there is none.
 NORV_API const char *NLIBCSzListGet(const NLIBC_SZ_LIST *list, int index);
 
+/// Creates a folder and its missing parents; the library passes 0, 1, -1, -1, -1 for the rest: mode
+/// and owners as the platform sees fit. Negative on failure.
+NORV_API int NORVFSMkdirP(const char *path, int flags, int parents, int uid, int gid, int mode);
+
 /// 1 when the path exists, else 0.
 NORV_API int NLIBCFileExist(const char *path);
 
