@@ -4,9 +4,11 @@
 #include "platform/iscsi_config.h"
 #include "platform/iscsi_lun.h"
 #include "platform/iscsi_snapshot.h"
+#include "platform/replication.h"
 
 #include <cstdlib>
 #include <memory>
+#include <search.h>
 
 namespace ISCSI {
 
@@ -47,10 +49,40 @@ struct SnapshotRecords {
     }
 };
 
+using TaskRecord = std::unique_ptr<_tag_iscsi_task_, FreeList>;
+
+/// A queue of task records, given up record by record.
+struct TaskRecords {
+    _tag_iscsi_task_ head{};
+
+    TaskRecords() = default;
+    TaskRecords(const TaskRecords &) = delete;
+    TaskRecords &operator=(const TaskRecords &) = delete;
+    ~TaskRecords()
+    {
+        while (takeFirst()) {
+        }
+    }
+
+    /// Unlinks the first record; null at the end of the queue.
+    TaskRecord takeFirst()
+    {
+        _tag_iscsi_task_ *record = head.forward;
+        if (record)
+            remque(record);
+        return TaskRecord(record);
+    }
+};
+
 struct FreeTextList {
     void operator()(NLIBC_SZ_LIST *list) const { NLIBCSzListFree(list); }
 };
 using TextList = std::unique_ptr<NLIBC_SZ_LIST, FreeTextList>;
+
+struct FreeTextHash {
+    void operator()(NLIBC_SZ_HASH *hash) const { NLIBCSzHashFree(hash); }
+};
+using TextHash = std::unique_ptr<NLIBC_SZ_HASH, FreeTextHash>;
 
 /// NORViSCSIConfGet with an owned answer.
 inline int queryConf(const _tag_iscsi_conf_query_ &query, Conf &out)

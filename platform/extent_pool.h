@@ -43,4 +43,8 @@ NORV_API int NORVExtentPoolMapFileSyncedCountGet(const char *path, uint64_t *cou
 /// Progress of the copy that fills a map file, or the snapshot in a folder: bytes done and bytes in all.
 NORV_API int NORViSCSIChildLunSyncProgressGet(const char *path, uint64_t *done, uint64_t *total);
 
+/// This appliance's ROD key, the secret that lets two appliances exchange data, into `key` of `size`
+/// bytes.
+NORV_API int NORVExtentPoolRODKeyGet(char *key, int size);
+
 NORV_END_DECLS

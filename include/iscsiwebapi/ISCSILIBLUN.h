@@ -3,6 +3,7 @@
 
 #include "iscsiwebapi/ISCSIExport.h"
 #include "iscsiwebapi/ISCSILUNInfo.h"
+#include "iscsiwebapi/ISCSINodeInfo.h"
 #include "iscsiwebapi/ISCSISnapshotInfo.h"
 
 #include <set>
@@ -113,6 +114,16 @@ public:
     /// ERR_NOW_IS_NOT_IMPORTING. ERR_FAILED_TO_GET_FILE_SESSION for an unreadable progress file, with
     /// the outputs before the unreadable one set.
     int getImportProgress(unsigned long long &done_bytes, unsigned long long &total_bytes, int &step);
+
+    /// Copies this LUN to a LUN on another node. An empty `dst_lun_uuid` creates the destination there,
+    /// named `dst_lun_name` at `dst_location`, and is set to it; a given one is used, and never
+    /// deleted. Only the first of the node's portals is used. Returns when the transfer runs; with
+    /// `watch`, a detached worker follows it to its end and cleans up (a failed copy's destination
+    /// goes if it was created here), without, the virtual LUN `vlun_uuid` is the caller's to follow
+    /// and delete. Extent-pool LUNs only, else ERR_CANNOT_CLONE_A_BLOCK_LUN.
+    int remoteClone(const std::string &dst_lun_name, const ISCSINodeInfo &node, const std::string &dst_location,
+                    const std::set<std::string> &portals, std::string &vlun_uuid, std::string &dst_lun_uuid,
+                    bool watch);
 
     /// ISCSILUNInfo::loadSyncProgress.
     int getSyncProgress(unsigned long long &done, unsigned long long &total);

@@ -1,0 +1,43 @@
+/// Requests to the web API of another appliance: the one place that speaks HTTP as a client.
+#pragma once
+
+#include <cstdint>
+#include <iscsihost/host.h>
+#include <string>
+
+namespace iscsihost {
+
+/// What is asked of whom.
+struct HttpsRequest {
+    std::string host; ///< name or address, without brackets
+    uint16_t port = 0;
+    std::string protocol;       ///< "https"; "http" only to a loopback address
+    std::string method = "GET"; ///< as on the wire
+    std::string path;           ///< with query, percent-encoded: "/api/v1/luns?status=true"
+    std::string token;          ///< session token, empty for none
+    std::string body;           ///< JSON, empty for none
+};
+
+struct HttpsAnswer {
+    int status = 0; ///< HTTP status
+    std::string content_type;
+    std::string body; ///< bounded: an answer above 64 MiB is refused
+};
+
+/// Sends one request and waits for its answer, with time-outs for connecting and for a transfer that stands still.
+/// Redirections are not followed. The server's key must be the one pinned for its host and port; without a pin its
+/// certificate must be valid for the machine's certificate authorities. Failures have a reason: who could not be
+/// reached, whose key changed (with both fingerprints). No secret is in a reason.
+ISCSI_HOST_API int https(const HttpsRequest &request, HttpsAnswer &answer);
+
+/// The key that a server shows now: SHA-256 of its public key (DER, SubjectPublicKeyInfo) in base64, as
+/// "sha256//..." - the form that pins have.
+ISCSI_HOST_API int fetchPin(const std::string &host, uint16_t port, std::string &pin);
+
+/// The pin of a host and port; empty when there is none.
+ISCSI_HOST_API int getPin(const std::string &host, uint16_t port, std::string &pin);
+
+/// Stores a pin in place of an earlier one; empty removes it.
+ISCSI_HOST_API int setPin(const std::string &host, uint16_t port, const std::string &pin);
+
+} // namespace iscsihost
