@@ -71,11 +71,12 @@ bool match(const std::string &pattern, const std::vector<std::string> &path, std
 
 } // namespace
 
-Result dispatch(Method method, const std::string &path, const Json::Value &input)
+Result dispatch(Method method, const std::string &path, const Json::Value &input, const std::string &account)
 {
     try {
         const std::vector<std::string> segments = split(path);
         Request request;
+        request.account = account;
         for (const Route &route : routes()) {
             if (route.method != method || !match(route.path, segments, request.path))
                 continue;

@@ -29,7 +29,11 @@ enum class Role {
 struct Request {
     std::map<std::string, std::string> path; ///< the values of the pattern's parameters, by name
     Json::Value input;                       ///< an object that holds the route's fields, checked
+    std::string account;                     ///< who asks
 };
+
+/// Who asks without a session: the administrator of the machine.
+constexpr char LOCAL_ACCOUNT[] = "admin";
 
 struct Result {
     int code = 0;       ///< 0, or the library's error code (ISCSIErrorCode.h)
@@ -52,7 +56,8 @@ const std::vector<Route> &routes();
 /// Finds the route, checks the input and runs the handler. The path's segments are percent-encoded;
 /// for a Get the input is what the query carries. ERR_NO_SUCH_API when no route fits,
 /// ERR_INVALID_INPUT or the field's own code for input that is refused. Throws nothing.
-Result dispatch(Method method, const std::string &path, const Json::Value &input);
+Result dispatch(Method method, const std::string &path, const Json::Value &input,
+                const std::string &account = LOCAL_ACCOUNT);
 
 /// Encodes a text as one segment of a path.
 std::string pathSegment(const std::string &text);

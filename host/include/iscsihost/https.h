@@ -16,6 +16,7 @@ struct HttpsRequest {
     std::string path;           ///< with query, percent-encoded: "/api/v1/luns?status=true"
     std::string token;          ///< session token, empty for none
     std::string body;           ///< JSON, empty for none
+    std::string pin;            ///< the server's key, as in getPin(); empty: the one pinned for its host and port
 };
 
 struct HttpsAnswer {
