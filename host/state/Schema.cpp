@@ -153,6 +153,43 @@ CREATE TABLE transfers (
 ) STRICT, WITHOUT ROWID;
 CREATE UNIQUE INDEX folders_of_exports ON transfers (folder) WHERE snap_id > 0;
 )sql",
+
+    R"sql(
+-- Nodes, accounts, virtual LUNs, replication.
+-- The password as crypt(5) has it; the one-time secret in base32, empty for none, with the time step of the code that
+-- was accepted last.
+CREATE TABLE accounts (
+    name TEXT PRIMARY KEY,
+    role TEXT NOT NULL CHECK (role IN ('viewer', 'admin')),
+    password TEXT NOT NULL,
+    otp_secret TEXT NOT NULL DEFAULT '',
+    otp_step INTEGER NOT NULL DEFAULT 0,
+    created INTEGER NOT NULL
+) STRICT, WITHOUT ROWID;
+
+-- The token's SHA-256 in hexadecimal. A session with an app is for a program and has the role of its own; a person's
+-- has its account's. The address is empty when the session may be used from any. A duration of 0 has no end.
+CREATE TABLE sessions (
+    id INTEGER PRIMARY KEY AUTOINCREMENT,
+    token_hash TEXT NOT NULL UNIQUE,
+    account TEXT NOT NULL,
+    app TEXT NOT NULL DEFAULT '',
+    opened_from TEXT NOT NULL,
+    address TEXT NOT NULL,
+    duration INTEGER NOT NULL DEFAULT 0,
+    created INTEGER NOT NULL,
+    last_used INTEGER NOT NULL
+) STRICT;
+
+-- Failed log-ins since the last good one, and when the next is looked at.
+CREATE TABLE login_failures (
+    kind TEXT NOT NULL CHECK (kind IN ('account', 'address')),
+    key TEXT NOT NULL,
+    failures INTEGER NOT NULL,
+    last INTEGER NOT NULL,
+    PRIMARY KEY (kind, key)
+) STRICT, WITHOUT ROWID;
+)sql",
 };
 
 constexpr int latest = static_cast<int>(std::size(steps));
