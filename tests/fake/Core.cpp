@@ -151,6 +151,8 @@ int NLIBCFileExist(const char *path)
 {
     if (auto failure = called(__func__, path))
         return *failure;
+    if (isPlatforms(path))
+        return model().section_files.count(path) != 0 ? 1 : 0;
     return access(path, F_OK) == 0 ? 1 : 0;
 }
 

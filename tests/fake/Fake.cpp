@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <cstdio>
+#include <unordered_set>
 
 namespace fake {
 namespace {
@@ -29,14 +30,14 @@ struct Failure {
     long value;
 };
 
-struct Answers {
+struct Sequence {
     uint32_t before; ///< calls of the name that came before the first value
     std::vector<long> values;
 };
 
 struct Script {
     std::vector<Failure> failures;
-    std::map<std::string, Answers> answers;
+    std::map<std::string, Sequence> answers;
 };
 
 Script &script()
@@ -45,7 +46,28 @@ Script &script()
     return the_script;
 }
 
+std::unordered_set<const void *> &listedRecords()
+{
+    static auto *records = new std::unordered_set<const void *>; // outlives whoever frees late
+    return *records;
+}
+
 } // namespace
+
+void noteListed(const void *memory)
+{
+    listedRecords().insert(memory);
+}
+
+void noteFreed(const void *memory)
+{
+    listedRecords().erase(memory);
+}
+
+int unfreedRecords()
+{
+    return static_cast<int>(listedRecords().size());
+}
 
 Model &model()
 {
@@ -58,6 +80,7 @@ void reset()
     model() = Model();
     script() = Script();
     journal().clear();
+    forgetLocks();
 }
 
 std::vector<Call> calls()

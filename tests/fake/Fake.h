@@ -2,11 +2,14 @@
 /// answers. A test program has one platform; reset() makes it new.
 #pragma once
 
+#include "platform/dr_node.h"
 #include "platform/extent_pool.h"
 #include "platform/iscsi_config.h"
 #include "platform/iscsi_lun.h"
 #include "platform/iscsi_snapshot.h"
 #include "platform/iscsi_target.h"
+#include "platform/replication.h"
+#include "platform/virtual_lun.h"
 
 #include <cstdint>
 #include <map>
@@ -53,6 +56,55 @@ struct Job {
     int lid;              ///< of a scheduled-snapshot task, else 0
 };
 
+/// What polls are answered, one after the other; the last value stays.
+template <class Value>
+struct Answers {
+    std::vector<Value> values;
+    size_t next = 0;
+
+    Value take()
+    {
+        if (values.empty())
+            return Value{};
+        return values[next + 1 < values.size() ? next++ : values.size() - 1];
+    }
+};
+
+/// A section of a section file, its keys in the order in which they were set.
+struct Section {
+    std::string name;
+    std::vector<std::pair<std::string, std::string>> keys;
+};
+
+struct VirtualLUN {
+    _tag_viscsi_virtual_lun_ record{};
+    Answers<_tag_viscsi_virtual_lun_stats_> stats;
+};
+
+struct Task {
+    _tag_iscsi_task_ record{};
+    Answers<_tag_iscsi_task_progress_> progress;
+    uint64_t unsync_size = 0; ///< bytes
+};
+
+/// What polls of a peer's LUN, snapshot or task see.
+struct PeerState {
+    bool is_locked = false;
+    unsigned long long sync_progress = 0;
+};
+
+/// The other appliance, as its web API shows it.
+struct Peer {
+    std::string account = "admin", password = "peer-password", otp_code = "123456"; ///< that a log-in is let in with
+    std::string token = "peer-token";                                               ///< that it is given
+    std::string rod_key = "peer-rod-key";
+    std::string lun_uuid = "22222222-0000-4000-8000-000000000001"; ///< of the next LUN created there
+    std::string snapshot_uuid = "22222222-0000-4000-8000-000000000002";
+    Answers<PeerState> states;
+    std::string base_version;
+    bool need_full_sync = false, not_aligned = false;
+};
+
 /// What the platform knows. Tests read it and change it as they like, into states that no call could
 /// reach too.
 struct Model {
@@ -68,6 +120,20 @@ struct Model {
     size_t retention_keeps = 1;                                       ///< newest things that every policy keeps
     int exit_status = 0;                                              ///< of every program run
     unsigned int uuids_made = 0;
+
+    /// Files below /usr/norv exist here only.
+    std::map<std::string, std::vector<Section>> section_files;
+    std::string local_node = "11111111-0000-4000-8000-000000000001";
+    std::vector<NorvDRNode::DRNode> nodes; ///< in listing order, the local one too
+    std::vector<NorvDRNode::DRNodeAttr> node_attributes;
+    std::string rod_key = "local-rod-key";
+    std::map<std::string, std::pair<unsigned int, unsigned int>> account_ids; ///< user and group
+    std::set<std::string> cgi_sessions;
+    std::set<std::string> missing_modules;
+    std::map<std::string, VirtualLUN> virtual_luns;        ///< by UUID
+    Answers<_tag_viscsi_virtual_lun_stats_> next_transfer; ///< of virtual LUNs made from now on
+    std::vector<Task> tasks;                               ///< in listing order
+    Peer peer;
 };
 
 Model &model();
@@ -107,8 +173,12 @@ void answer(const std::string &name, const std::vector<long> &values);
 /// 128 + n for one that signal n ended.
 std::vector<int> waitForChildren();
 
-/// Answers of NORViSCSIConfGet and NORViSCSIConfTargetLoad, snapshot records of listings, and lists of
-/// texts that were not freed yet; the records are counted down in programs with fake_process.
+/// Paths of the lock files that anyone holds.
+std::vector<std::string> lockedFiles();
+
+/// Answers of NORViSCSIConfGet and NORViSCSIConfTargetLoad, records of snapshot and task listings, lists and hashes of
+/// texts, credentials and CGI handles that were not freed yet; the records are counted down in programs with
+/// fake_process.
 int unfreedAnswers();
 void noteFreed(const void *memory);
 

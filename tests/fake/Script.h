@@ -83,10 +83,23 @@ LUN *findLUN(const char *uuid);
 /// What NORViSCSILunCreate does, with its codes.
 int createLUN(_tag_iscsi_lun_ &lun);
 
+/// Whether a path exists in the model only.
+inline bool isPlatforms(const std::string &path)
+{
+    return path.rfind("/usr/norv/", 0) == 0;
+}
+
 /// What NLIBCSzListPush does.
 int pushText(NLIBC_SZ_LIST &list, const std::string &text);
 
-int unfreedSnapshots();
+/// A record of a listing, from the C allocator, that counts as unfreed until noteFreed() sees it.
+void noteListed(const void *memory);
+int unfreedRecords();
 int unfreedLists();
+int unfreedHashes();
+int unfreedHandles();
+
+/// Closes every lock file.
+void forgetLocks();
 
 } // namespace fake

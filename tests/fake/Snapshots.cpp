@@ -8,7 +8,6 @@
 
 #include <cstdio>
 #include <cstdlib>
-#include <unordered_set>
 
 using namespace fake;
 
@@ -45,12 +44,6 @@ bool isAsked(const _tag_iscsi_snapshot_query_ &query, const _tag_iscsi_snapshot_
            (!(query.query_flags & NORV_SNAPSHOT_QUERY_TIME) || record.snap_time >= query.query_time);
 }
 
-std::unordered_set<const void *> &listedRecords()
-{
-    static auto *records = new std::unordered_set<const void *>; // outlives whoever frees late
-    return *records;
-}
-
 int freeNumber(int lid)
 {
     int number = 1;
@@ -83,16 +76,6 @@ int waitFor(bool is_locked)
 
 } // namespace
 
-int fake::unfreedSnapshots()
-{
-    return static_cast<int>(listedRecords().size());
-}
-
-void fake::noteFreed(const void *memory)
-{
-    listedRecords().erase(memory);
-}
-
 int NORViSCSISnapshotConfGetByUUID(const char *uuid, _tag_iscsi_snapshot_ *snapshot)
 {
     if (auto failure = called(__func__, uuid))
@@ -116,7 +99,7 @@ int NORViSCSISnapshotConfLoad(const _tag_iscsi_snapshot_query_ *query, _tag_iscs
         auto *record = static_cast<_tag_iscsi_snapshot_ *>(malloc(sizeof(_tag_iscsi_snapshot_)));
         if (!record)
             return NORV_ERR_OUT_OF_MEMORY;
-        listedRecords().insert(record);
+        noteListed(record);
         *record = snapshot.record;
         record->previous = list->last;
         record->next = nullptr;

@@ -144,7 +144,7 @@ int judge(const _tag_iscsi_target_ &target)
 
 int fake::unfreedAnswers()
 {
-    return unfreed + unfreedSnapshots() + unfreedLists();
+    return unfreed + unfreedRecords() + unfreedLists() + unfreedHashes() + unfreedHandles();
 }
 
 int NORViSCSIConfGet(const _tag_iscsi_conf_query_ *query, _tag_iscsi_conf_ **conf)
