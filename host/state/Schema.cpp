@@ -189,6 +189,34 @@ CREATE TABLE login_failures (
     last INTEGER NOT NULL,
     PRIMARY KEY (kind, key)
 ) STRICT, WITHOUT ROWID;
+
+-- Other appliances, in the order in which they were met. A session that was opened on one is kept before the two are
+-- paired. Attributes may also be the local node's.
+CREATE TABLE nodes (
+    id INTEGER PRIMARY KEY AUTOINCREMENT,
+    uuid TEXT NOT NULL UNIQUE,
+    host TEXT NOT NULL,
+    port INTEGER NOT NULL CHECK (port BETWEEN 1 AND 65535),
+    protocol TEXT NOT NULL,
+    token TEXT NOT NULL,
+    paired INTEGER NOT NULL CHECK (paired IN (0, 1))
+) STRICT;
+
+CREATE TABLE node_attributes (
+    uuid TEXT NOT NULL,
+    app TEXT NOT NULL,
+    key TEXT NOT NULL,
+    value TEXT NOT NULL,
+    PRIMARY KEY (uuid, app, key)
+) STRICT, WITHOUT ROWID;
+
+-- The keys that web servers are known by, as "sha256//" and base64.
+CREATE TABLE pins (
+    host TEXT NOT NULL,
+    port INTEGER NOT NULL CHECK (port BETWEEN 1 AND 65535),
+    pin TEXT NOT NULL,
+    PRIMARY KEY (host, port)
+) STRICT, WITHOUT ROWID;
 )sql",
 };
 
