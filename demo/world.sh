@@ -13,8 +13,9 @@ build=$(realpath "$1")
 shift
 
 mount -t tmpfs -o mode=0755 tmpfs /run
-mkdir -p /run/world/{upper,work,tree}
+mkdir -p /run/world/{upper,work,tree/tests}
 cp -r "$tree/demo" "$tree/bench" /run/world/tree/
+cp -r "$tree/tests/pair" /run/world/tree/tests/
 if [[ -d $build/bench ]]; then
     find "$build/bench" -maxdepth 1 -type f -executable -exec cp -t /run/world/tree/bench {} +
 fi

@@ -1,0 +1,31 @@
+#!/usr/bin/env bash
+# machine.sh NAME: one machine of a pair, in namespaces that pair.py has just made for it: folders of its own where an appliance
+# keeps things, and nothing running. Says "made", reads the machine's address from standard input when its network card is there,
+# says "ready", and is then the machine's first process: when it dies, the machine is gone.
+set -euo pipefail
+
+hostname "$1"
+# /usr is the world's and shared; the folder of the node configuration file is not.
+mkdir -p /usr/norv/etc
+mount -t tmpfs -o mode=0755 tmpfs /usr/norv/etc
+mount -t tmpfs -o mode=0755 tmpfs /run
+for folder in /etc /var; do
+    mkdir -p "/run/layers$folder/upper" "/run/layers$folder/work"
+    mount -t overlay overlay -o "lowerdir=$folder,upperdir=/run/layers$folder/upper,workdir=/run/layers$folder/work" "$folder"
+done
+mkdir -p /var/lib/iscsi-host
+chmod 700 /var/lib/iscsi-host
+mount -t tmpfs -o mode=0700 tmpfs /var/lib/iscsi-host # not on the overlay: it holds the volume's image
+mount -t tmpfs -o mode=1777 tmpfs /tmp
+mount -t tmpfs -o mode=0755 tmpfs /mnt
+printf '127.0.0.1 localhost %s\n' "$1" >/etc/hosts
+ip link set lo up
+
+echo made
+read -r address
+ip address add "$address/24" dev eth0
+ip link set eth0 up
+echo ready
+# Takes in what its daemons leave behind.
+sleep infinity &
+wait

@@ -1,0 +1,171 @@
+"""Two appliances on one machine, each in namespaces of its own, on a network that reaches nothing else.
+
+Works inside demo/world.sh only, whose installed build, processes and network it uses: the world is the third machine, where
+initiators run, at 192.0.2.1. Everything ends with the world.
+"""
+import json
+import os
+import secrets
+import signal
+import subprocess
+import sys
+import time
+
+HERE = os.path.dirname(os.path.abspath(__file__))
+MACHINES = "/run/world/machines"  # NAME -> the process to enter the machine by
+BRIDGE, BRIDGE_ADDRESS = "lan", "192.0.2.1"
+VOLUME = "/mnt/volume1"
+ACCOUNT = "admin"
+
+
+class Failed(Exception):
+    """A program ended with another exit status than 0. `.result` is its subprocess.CompletedProcess."""
+
+    def __init__(self, result):
+        command = result.args if isinstance(result.args, str) else " ".join(result.args)
+        super().__init__(f"{command}: exit status {result.returncode}\n{result.stdout}{result.stderr}")
+        self.result = result
+
+
+def run(*command, check=True, timeout=120, stdin="", **options):
+    """The finished program, with its output as text; Failed when its exit status is not 0."""
+    result = subprocess.run(command, input=stdin, capture_output=True, text=True, timeout=timeout, errors="replace", **options)
+    if check and result.returncode:
+        raise Failed(result)
+    return result
+
+
+def wait_until(true, what, seconds=20):
+    """Returns what `true()` returned, once that is true."""
+    end = time.monotonic() + seconds
+    while True:
+        if outcome := true():
+            return outcome
+        if time.monotonic() > end:
+            raise AssertionError(f"not within {seconds} s: {what}")
+        time.sleep(0.02)
+
+
+class Machine:
+    """A machine with nothing running on it, plugged into the bridge."""
+
+    def __init__(self, name, address):
+        self.name, self.address = name, address
+        self.holder = subprocess.Popen(
+            ["unshare", "--mount", "--uts", "--ipc", "--net", "--pid", "--fork", "--kill-child", "--mount-proc",
+             f"{HERE}/machine.sh", name], stdin=subprocess.PIPE, stdout=subprocess.PIPE, text=True, start_new_session=True)
+        self._expect("made")
+        with open(f"/proc/{self.holder.pid}/task/{self.holder.pid}/children", encoding="ascii") as children:
+            self.pid = int(children.read())
+        self.environment = {key: value for key, value in os.environ.items() if not key.startswith("ISCSI_HOST_")}
+        self._plug_in()
+        self.holder.stdin.write(address + "\n")
+        self.holder.stdin.flush()
+        self._expect("ready")
+        os.makedirs(MACHINES, exist_ok=True)
+        with open(f"{MACHINES}/{name}", "w", encoding="ascii") as file:
+            file.write(f"{self.pid}\n")
+
+    def _expect(self, word):
+        if (said := self.holder.stdout.readline().strip()) != word:
+            raise SystemExit(f"the machine '{self.name}' did not start: {said or 'see above'}")
+
+    def _plug_in(self):
+        if run("ip", "link", "show", BRIDGE, check=False).returncode:
+            run("ip", "link", "add", BRIDGE, "type", "bridge")
+            run("ip", "address", "add", f"{BRIDGE_ADDRESS}/24", "dev", BRIDGE)
+            run("ip", "link", "set", BRIDGE, "up")
+        run("ip", "link", "add", self.name, "type", "veth", "peer", "name", "eth0", "netns", str(self.pid))
+        run("ip", "link", "set", self.name, "master", BRIDGE, "up")
+
+    def power_off(self):
+        """The machine and everything on it is gone, at once."""
+        self.holder.kill()
+        self.holder.wait()
+        self.holder.stdin.close()
+        self.holder.stdout.close()
+        os.unlink(f"{MACHINES}/{self.name}")
+
+    def entering(self, *command):
+        return ["nsenter", "-t", str(self.pid), "-m", "-u", "-i", "-n", "-p", "--wd=/", "--", *command]
+
+    def run(self, *command, **options):
+        return run(*self.entering(*command), env=self.environment, **options)
+
+    def start(self, *command, **options):
+        """A program in the background: subprocess.Popen with output as text."""
+        return subprocess.Popen(self.entering(*command), env=self.environment, text=True, errors="replace", **options)
+
+    def processes(self, name):
+        """Process IDs, as the world sees them, of the machine's processes of this name."""
+        space, found = os.readlink(f"/proc/{self.pid}/ns/pid"), []
+        for entry in filter(str.isdigit, os.listdir("/proc")):
+            try:
+                with open(f"/proc/{entry}/comm", encoding="utf-8") as comm, open(f"/proc/{entry}/stat", encoding="utf-8") as stat:
+                    alive = stat.read().rpartition(")")[2].split()[0] not in "ZX"
+                    if comm.read().strip() == name and alive and os.readlink(f"/proc/{entry}/ns/pid") == space:
+                        found.append(int(entry))
+            except (FileNotFoundError, ProcessLookupError):
+                pass
+        return found
+
+    def kill(self, name, sig=signal.SIGKILL):
+        """Sends the signal to the machine's processes of this name; their IDs."""
+        pids = self.processes(name)
+        assert pids, f"no {name} runs on {self.name}"
+        for pid in pids:
+            os.kill(pid, sig)
+        return pids
+
+    def cut_link(self):
+        run("ip", "link", "set", self.name, "down")
+
+    def mend_link(self):
+        run("ip", "link", "set", self.name, "up")
+
+
+class Appliance(Machine):
+    """A machine with a booted and supervised appliance: one volume, one account, the web API."""
+
+    def __init__(self, name, address, volume_size="4G"):
+        super().__init__(name, address)
+        self.password = secrets.token_hex(8)
+        self.run("iscsi-host", "portal", "set", address)
+        self.run("iscsi-host", "volume", "create", VOLUME, "--size", volume_size)
+        self.run("iscsi-host", "boot")
+        self.supervisor = self.start("iscsi-host", "run", stdin=subprocess.DEVNULL, stdout=subprocess.DEVNULL,
+                                     start_new_session=True)
+
+    def iscsictl(self, *arguments, **options):
+        """iscsictl's standard output; Failed when it fails."""
+        return self.run("iscsictl", *arguments, **options).stdout
+
+    def json(self, *arguments, **options):
+        return json.loads(self.iscsictl(*arguments, "--json", **options))
+
+    def refuses(self, *arguments, **options):
+        """Standard error of an iscsictl that has to fail."""
+        result = self.run("iscsictl", *arguments, check=False, **options)
+        assert result.returncode == 1, f"{arguments}: exit status {result.returncode}\n{result.stdout}{result.stderr}"
+        return result.stderr
+
+    def host(self, *arguments, **options):
+        return self.run("iscsi-host", *arguments, **options).stdout
+
+
+def pair(volume_size="4G"):
+    return Appliance("one", "192.0.2.11", volume_size), Appliance("two", "192.0.2.12", volume_size)
+
+
+def hold():
+    """For pair.sh: a pair that stays until the world ends. Standard input ending means that nobody wants it any more."""
+    for appliance in pair():
+        print(appliance.name, appliance.address, appliance.password, flush=True)
+    if sys.stdin.readline().strip() != "stay":
+        return 1
+    while True:
+        signal.pause()
+
+
+if __name__ == "__main__":
+    sys.exit(hold())
