@@ -9,8 +9,7 @@ fi
 
 # shellcheck source=demo/story.sh
 . demo/story.sh
-ip address add "$PORTAL/32" dev lo
-trap 'iscsi-host stop >/dev/null 2>&1 || true' EXIT
+switch_on one "$PORTAL"
 for chapter in demo/chapters/*.sh; do
     # shellcheck source=/dev/null
     . "$chapter"

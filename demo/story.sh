@@ -1,8 +1,23 @@
 # shellcheck shell=bash
-# The verbs that the chapters are written in.
+# The verbs that the chapters are written in. Initiators run here; appliances are machines of their own, 'one' the first of them.
 
-# shellcheck disable=SC2034 # the chapters use them
-PORTAL=192.0.2.10
+PORTAL=192.0.2.11
+
+# switch_on NAME ADDRESS: a machine, with the build installed and nothing running.
+switch_on() {
+    local maker
+    exec {maker}< <(exec python3 -B tests/pair/pair.py machine "$1" "$2")
+    read -r _ <&"$maker" || wrong "the machine '$1' did not start"
+}
+
+# on NAME COMMAND...: runs a command on a machine.
+on() {
+    local name=$1
+    shift
+    nsenter -t "$(<"/run/world/machines/$name")" -m -u -i -n -p --wd=/ -- env -u ISCSI_HOST_STATE -u ISCSI_HOST_RUN "$@"
+}
+iscsictl() { on one iscsictl "$@"; }
+iscsi-host() { on one iscsi-host "$@"; }
 
 title() { printf '\n%s\n%s\n' "$1" "${1//?/=}"; }
 tell() { printf '\n%s\n' "$*"; }

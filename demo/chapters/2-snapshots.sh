@@ -66,7 +66,7 @@ same "what alice read from the LUN" "$(checksum "$COPY")" "$(checksum /tmp/image
 title "Export, import, and what the appliance does by itself"
 tell "The snapshot is exported to a directory, and imported into another LUN, which gets a snapshot of it."
 do_it iscsictl snapshot export keep_monday /tmp/exported --watch
-do_it ls -sh /tmp/exported
+do_it on one ls -sh /tmp/exported
 do_it iscsictl lun create fresh --location /mnt/volume1 --size 64M
 do_it iscsictl lun import fresh /tmp/exported --watch
 do_it iscsictl lun map fresh keeper

@@ -157,15 +157,26 @@ def pair(volume_size="4G"):
     return Appliance("one", "192.0.2.11", volume_size), Appliance("two", "192.0.2.12", volume_size)
 
 
-def hold():
-    """For pair.sh: a pair that stays until the world ends. Standard input ending means that nobody wants it any more."""
-    for appliance in pair():
-        print(appliance.name, appliance.address, appliance.password, flush=True)
-    if sys.stdin.readline().strip() != "stay":
-        return 1
+def stay():
     while True:
         signal.pause()
 
 
+def hold_pair():
+    """For pair.sh. Standard input ending means that nobody wants the pair any more."""
+    for appliance in pair():
+        print(appliance.name, appliance.address, appliance.password, flush=True)
+    if sys.stdin.readline().strip() == "stay":
+        stay()
+
+
+def main():
+    if len(sys.argv) == 4 and sys.argv[1] == "machine":
+        Machine(*sys.argv[2:])
+        print("ready", flush=True)
+        stay()
+    hold_pair()
+
+
 if __name__ == "__main__":
-    sys.exit(hold())
+    main()
