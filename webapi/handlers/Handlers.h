@@ -4,8 +4,9 @@
 #include "webapi/handlers/Route.h"
 
 namespace ISCSI {
+class ISCSINodeInfo;
 class ISCSISnapshotInfo;
-}
+} // namespace ISCSI
 
 namespace webapi {
 
@@ -63,10 +64,37 @@ Result addSchedule(const Request &request);
 Result removeSchedule(const Request &request);
 Result listEvents(const Request &request);
 
+Result listNodes(const Request &request);
+Result showNode(const Request &request);
+Result addNodes(const Request &request);
+Result joinNode(const Request &request);
+Result openPeerSession(const Request &request);
+Result showLocalKey(const Request &request);
+Result showLocalStatus(const Request &request);
+Result removeNode(const Request &request);
+Result showPeerKey(const Request &request);
+Result trustNode(const Request &request);
+Result loginNode(const Request &request);
+Result logoutNode(const Request &request);
+
+Result listVluns(const Request &request);
+Result createVlun(const Request &request);
+Result showVlun(const Request &request);
+Result bindVlun(const Request &request);
+Result deleteVlun(const Request &request);
+Result remoteCloneLun(const Request &request);
+Result showRemoteClone(const Request &request);
+
+/// Bytes that have arrived of a copy that is under way, else 0.
+Json::UInt64 syncProgress(unsigned long long done, unsigned long long total);
+
 /// Resolves a LUN selector to a UUID (which may name no LUN), or a target selector to a target ID
 /// (which may name no target).
 Result selectLun(const std::string &selector, std::string &uuid);
 Result selectTarget(const std::string &selector, int &tid);
+
+/// Loads the node that a selector names; "local" is this appliance.
+Result selectNode(const std::string &selector, ISCSI::ISCSINodeInfo &node);
 
 /// Loads the snapshot that the request's path selects, with its lock facts, and finds its LUN.
 Result selectSnapshot(const Request &request, ISCSI::ISCSISnapshotInfo &snapshot, std::string &lun_uuid);

@@ -3,6 +3,7 @@
 #include "iscsiwebapi/ISCSIErrorCode.h"
 
 #include <algorithm>
+#include <cctype>
 #include <string_view>
 
 namespace webapi {
@@ -163,6 +164,13 @@ private:
 int checkInput(Fields fields, const Json::Value &input, std::string &reason)
 {
     return Checker(reason).checkObject(fields, input, "");
+}
+
+bool isUuid(const std::string &text)
+{
+    static const std::string form = "xxxxxxxx-xxxx-xxxx-xxxx-xxxxxxxxxxxx";
+    return std::equal(text.begin(), text.end(), form.begin(), form.end(),
+                      [](unsigned char c, char wanted) { return wanted == 'x' ? std::isxdigit(c) != 0 : c == wanted; });
 }
 
 } // namespace webapi

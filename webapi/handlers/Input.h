@@ -54,4 +54,7 @@ inline const Field *Fields::end() const
 /// that is wrong; values are not repeated there, they can be secrets.
 int checkInput(Fields fields, const Json::Value &input, std::string &reason);
 
+/// Whether the text is of the form 8-4-4-4-12 hexadecimal digits.
+bool isUuid(const std::string &text);
+
 } // namespace webapi

@@ -33,7 +33,7 @@ void addAllocatedSize(ISCSILUNInfo &lun, _tag_iscsi_lun_ &record, Json::Value &o
         out.removeMember("allocated_size");
 }
 
-/// The LUN's JSON form with all live state, and "targets": where it is mapped.
+/// The LUN's JSON form with all live state, "sync_progress", and "targets": where it is mapped.
 Result describe(const std::string &uuid)
 {
     using Flags = ISCSILUNInfo::LoadFlags;
@@ -45,6 +45,11 @@ Result describe(const std::string &uuid)
     if (int err = lun.info.toJsonFormat(result.value))
         return failed(err);
     addAllocatedSize(lun.info, lun.record, result.value);
+    unsigned long long done = 0, total = 0;
+    if (lun.info.loadSyncProgress(lun.record, done, total) == 0)
+        result.value["sync_progress"] = syncProgress(done, total);
+    else
+        result.value["sync_progress"] = 0u; // its data is missing or damaged
 
     Json::Value &mappings = result.value["targets"] = Json::arrayValue;
     if (!lun.info.is_mapped)
@@ -87,6 +92,11 @@ Result selectTargets(const Json::Value &selectors, std::set<int> &tids)
 }
 
 } // namespace
+
+Json::UInt64 syncProgress(unsigned long long done, unsigned long long total)
+{
+    return done < total ? done : 0;
+}
 
 Result selectLun(const std::string &selector, std::string &uuid)
 {

@@ -27,6 +27,15 @@ constexpr uint64_t APP_KEY_MAX_BYTES = 127;
 constexpr uint64_t RULE_MAX_BYTES = 255;
 constexpr uint64_t EVENTS_MAX = 10000; // as many as are kept
 constexpr uint64_t MAX_MASKS = 1024;   // bounds the work of one request
+constexpr uint64_t MAX_NODES = 256;
+constexpr uint64_t MAX_PORTALS = 16;
+constexpr uint64_t HOST_MAX_BYTES = 253; // RFC 1035, 3.1, as text
+constexpr uint64_t PORTAL_MAX_BYTES = HOST_MAX_BYTES + 8;
+constexpr uint64_t PASSWORD_MAX_BYTES = 512;
+constexpr uint64_t OTP_MAX_BYTES = 16;
+constexpr uint64_t PIN_MAX_BYTES = 64;
+constexpr uint64_t TOKEN_MAX_BYTES = 255;
+constexpr uint64_t UUID_BYTES = 36;
 
 constexpr Field LUN_LIST[] = {
     {"status", Type::Boolean, OPTIONAL, 0, 0, 0},
@@ -99,6 +108,7 @@ constexpr Field SNAPSHOT_TAKE[] = {
     {"is_app_consistent", Type::Boolean, OPTIONAL, 0, 0, 0},
     {"is_user_locked", Type::Boolean, OPTIONAL, 0, 0, 0},
     {"is_scheduled", Type::Boolean, OPTIONAL, 0, 0, 0},
+    {"snapshot_time", Type::Unsigned, OPTIONAL, 0, INT32_MAX, ERR_BAD_SNAPSHOT_TIME}, // 0: now
 };
 
 constexpr Field SNAPSHOT_DELETE[] = {
@@ -134,6 +144,70 @@ constexpr Field EVENTS[] = {
     {"count", Type::Unsigned, OPTIONAL, 1, EVENTS_MAX, ERR_BAD_PARAMETER},
 };
 
+constexpr Field PEER_HOST[] = {
+    {"hostname", Type::Text, REQUIRED, 1, HOST_MAX_BYTES, ERR_BAD_NODE_HOSTNAME},
+};
+
+constexpr Field PEER[] = {
+    {"hostname", Type::Text, REQUIRED, 1, HOST_MAX_BYTES, ERR_BAD_NODE_HOSTNAME},
+    {"port", Type::Unsigned, OPTIONAL, 1, UINT16_MAX, ERR_BAD_NODE_PORT},
+};
+
+constexpr Field NODE_JOIN[] = {
+    {"hostname", Type::Text, REQUIRED, 1, HOST_MAX_BYTES, ERR_BAD_NODE_HOSTNAME},
+    {"port", Type::Unsigned, OPTIONAL, 1, UINT16_MAX, ERR_BAD_NODE_PORT},
+    {"account", Type::Text, REQUIRED, 1, NAME_MAX_BYTES, ERR_BAD_NODE_ACCOUNT},
+    {"password", Type::Text, REQUIRED, 1, PASSWORD_MAX_BYTES, ERR_BAD_NODE_PASSWORD},
+    {"otp_code", Type::Text, OPTIONAL, 0, OTP_MAX_BYTES, ERR_BAD_NODE_OTP_CODE},
+    {"pin", Type::Text, OPTIONAL, 1, PIN_MAX_BYTES, ERR_BAD_PARAMETER},
+};
+
+constexpr Field NODE[] = {
+    {"uuid", Type::Text, REQUIRED, 1, UUID_BYTES, ERR_BAD_NODE_UUID},
+    {"hostname", Type::Text, REQUIRED, 1, HOST_MAX_BYTES, ERR_BAD_NODE_HOSTNAME},
+    {"port", Type::Unsigned, REQUIRED, 1, UINT16_MAX, ERR_BAD_NODE_PORT},
+    {"protocol", Type::Text, REQUIRED, 1, 8, ERR_BAD_NODE_PROTOCOL, "https|http"},
+    {"rod_key", Type::Text, REQUIRED, 0, TOKEN_MAX_BYTES, ERR_BAD_NODE_ROD_KEY},
+    {"session_id", Type::Text, REQUIRED, 0, TOKEN_MAX_BYTES, ERR_FAILED_TO_GET_SESSION_ID},
+    {"pin", Type::Text, OPTIONAL, 0, PIN_MAX_BYTES, ERR_BAD_PARAMETER},
+};
+constexpr Field NODE_ELEMENT[] = {{"", Type::Object, REQUIRED, 0, 0, 0, nullptr, NODE}};
+
+constexpr Field NODES_ADD[] = {
+    {"nodes", Type::List, REQUIRED, 1, MAX_NODES, ERR_INVALID_INPUT, nullptr, NODE_ELEMENT},
+};
+
+constexpr Field NODE_TRUST[] = {
+    {"pin", Type::Text, REQUIRED, 1, PIN_MAX_BYTES, ERR_BAD_PARAMETER},
+};
+
+constexpr Field NODE_LOGIN[] = {
+    {"account", Type::Text, REQUIRED, 1, NAME_MAX_BYTES, ERR_BAD_NODE_ACCOUNT},
+    {"password", Type::Text, REQUIRED, 1, PASSWORD_MAX_BYTES, ERR_BAD_NODE_PASSWORD},
+    {"otp_code", Type::Text, OPTIONAL, 0, OTP_MAX_BYTES, ERR_BAD_NODE_OTP_CODE},
+};
+
+constexpr Field VLUN_CREATE[] = {
+    {"lun", Type::Text, REQUIRED, 1, NAME_MAX_BYTES, ERR_BAD_LUN_UUID},
+};
+
+constexpr Field PORTAL_ELEMENT[] = {{"", Type::Text, REQUIRED, 1, PORTAL_MAX_BYTES, ERR_BAD_PORTALS}};
+
+constexpr Field VLUN_BIND[] = {
+    {"node", Type::Text, REQUIRED, 1, HOST_MAX_BYTES, ERR_BAD_NODE_UUID},
+    {"dst_lun_uuid", Type::Text, REQUIRED, 1, UUID_BYTES, ERR_BAD_DESTINATION_LUN_UUID},
+    {"portals", Type::List, OPTIONAL, 1, MAX_PORTALS, ERR_BAD_PORTALS, nullptr, PORTAL_ELEMENT},
+};
+
+constexpr Field REMOTE_CLONE[] = {
+    {"node", Type::Text, REQUIRED, 1, HOST_MAX_BYTES, ERR_BAD_NODE_UUID},
+    {"name", Type::Text, OPTIONAL, 1, NAME_MAX_BYTES, ERR_BAD_LUN_NAME},
+    {"location", Type::Text, OPTIONAL, 1, LOCATION_MAX_BYTES, ERR_BAD_LUN_LOCATION},
+    {"portals", Type::List, OPTIONAL, 1, MAX_PORTALS, ERR_BAD_PORTALS, nullptr, PORTAL_ELEMENT},
+    {"dst_lun_uuid", Type::Text, OPTIONAL, 1, UUID_BYTES, ERR_BAD_DESTINATION_LUN_UUID},
+    {"watch", Type::Boolean, OPTIONAL, 0, 0, 0}, // true unless it is given
+};
+
 constexpr Fields NONE;
 
 } // namespace
@@ -151,6 +225,8 @@ const std::vector<Route> &routes()
         {Method::Post, "/luns/{lun}/load", Role::Admin, LUN_LOADING, loadLun},
         {Method::Post, "/luns/{lun}/unload", Role::Admin, LUN_LOADING, unloadLun},
         {Method::Post, "/luns/{lun}/clone", Role::Admin, CLONE, cloneLun},
+        {Method::Get, "/luns/{lun}/remote-clone", Role::Viewer, NONE, showRemoteClone},
+        {Method::Post, "/luns/{lun}/remote-clone", Role::Admin, REMOTE_CLONE, remoteCloneLun},
         {Method::Get, "/luns/{lun}/import", Role::Viewer, NONE, showImport},
         {Method::Post, "/luns/{lun}/import", Role::Admin, DIRECTORY, importLun},
         {Method::Delete, "/luns/{lun}/import", Role::Admin, NONE, cancelImport},
@@ -183,6 +259,23 @@ const std::vector<Route> &routes()
         {Method::Get, "/targets/{target}/masks", Role::Viewer, NONE, showMasks},
         {Method::Put, "/targets/{target}/masks", Role::Admin, MASKS_SET, setMasks},
         {Method::Patch, "/targets/{target}/masks", Role::Admin, MASKS_CHANGE, changeMasks},
+        {Method::Get, "/nodes", Role::Viewer, NONE, listNodes},
+        {Method::Post, "/nodes", Role::Admin, NODES_ADD, addNodes},
+        {Method::Post, "/nodes/join", Role::Admin, NODE_JOIN, joinNode},
+        {Method::Get, "/nodes/local/status", Role::Viewer, NONE, showLocalStatus},
+        {Method::Get, "/nodes/local/key", Role::Admin, NONE, showLocalKey},
+        {Method::Post, "/nodes/local/sessions", Role::Admin, PEER_HOST, openPeerSession},
+        {Method::Get, "/nodes/{node}", Role::Viewer, NONE, showNode},
+        {Method::Delete, "/nodes/{node}", Role::Admin, NONE, removeNode},
+        {Method::Post, "/nodes/{node}/trust", Role::Admin, NODE_TRUST, trustNode},
+        {Method::Post, "/nodes/{node}/login", Role::Admin, NODE_LOGIN, loginNode},
+        {Method::Post, "/nodes/{node}/logout", Role::Admin, NONE, logoutNode},
+        {Method::Get, "/peer-key", Role::Admin, PEER, showPeerKey},
+        {Method::Get, "/vluns", Role::Viewer, NONE, listVluns},
+        {Method::Post, "/vluns", Role::Admin, VLUN_CREATE, createVlun},
+        {Method::Get, "/vluns/{uuid}", Role::Viewer, NONE, showVlun},
+        {Method::Delete, "/vluns/{uuid}", Role::Admin, NONE, deleteVlun},
+        {Method::Post, "/vluns/{uuid}/bind", Role::Admin, VLUN_BIND, bindVlun},
     };
     return table;
 }

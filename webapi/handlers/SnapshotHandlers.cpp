@@ -32,6 +32,10 @@ Result describe(const std::string &uuid)
     if (int err = lun.loadFromConfig(record, 0))
         return failed(err);
     result.value["lun_name"] = lun.name;
+    unsigned long long done = 0, total = 0;
+    if (int err = snapshot.loadSyncProgress(done, total))
+        return failed(err);
+    result.value["sync_progress"] = syncProgress(done, total);
     return result;
 }
 
@@ -116,11 +120,13 @@ Result takeSnapshot(const Request &request)
     ISCSILIBLUN lun;
     if (Result bad = selectLun(request.path.at("lun"), lun.info.uuid); bad.code)
         return bad;
+    const long point_in_time = static_cast<long>(in["snapshot_time"].asInt64());
     std::string uuid;
     int id = 0;
-    if (int err = lun.takeSnapshot(in["is_app_consistent"].asBool(), in["is_user_locked"].asBool(),
-                                   in["name"].asString(), in["description"].asString(), in["taken_by"].asString(),
-                                   time(nullptr), in["is_scheduled"].asBool(), uuid, id))
+    if (int err =
+            lun.takeSnapshot(in["is_app_consistent"].asBool(), in["is_user_locked"].asBool(), in["name"].asString(),
+                             in["description"].asString(), in["taken_by"].asString(),
+                             point_in_time ? point_in_time : time(nullptr), in["is_scheduled"].asBool(), uuid, id))
         return failed(err);
     return describe(uuid);
 }

@@ -13,7 +13,7 @@ namespace {
 
 Result describeLun(const std::string &uuid)
 {
-    return showLun({{{"lun", uuid}}, {}});
+    return showLun({{{"lun", uuid}}, {}, {}});
 }
 
 /// `locked` was asked before the rest: when nothing holds the lock, the rest is how it ended.

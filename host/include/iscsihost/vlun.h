@@ -1,0 +1,31 @@
+/// Virtual LUNs as the front ends list and follow them.
+#pragma once
+
+#include <cstdint>
+#include <iscsihost/host.h>
+#include <string>
+#include <vector>
+
+namespace iscsihost {
+
+/// A virtual LUN and what it sends.
+struct VirtualLun {
+    std::string uuid;
+    std::string src_lun_uuid;
+    std::string node_uuid;    ///< where it is bound to; this and the next two are empty before
+    std::string dst_lun_uuid; ///< of the sink LUN there
+    std::string portal;
+    int state = 0;      ///< 0, or the errno value that ended the transfer
+    uint64_t moved = 0; ///< bytes
+    uint64_t total = 0; ///< bytes; 0 while it is not known yet
+    bool exists = true; ///< false for one that was removed
+};
+
+/// Every virtual LUN, ascending by age.
+ISCSI_HOST_API int listVirtualLuns(std::vector<VirtualLun> &vluns);
+
+/// The virtual LUN that was bound last to send this LUN; after its removal what it had become by then.
+/// 18991001 ("Bad vLUN UUID") when there never was one.
+ISCSI_HOST_API int latestTransfer(const std::string &src_lun_uuid, VirtualLun &vlun);
+
+} // namespace iscsihost
