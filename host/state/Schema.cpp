@@ -167,8 +167,8 @@ CREATE TABLE accounts (
     created INTEGER NOT NULL
 ) STRICT, WITHOUT ROWID;
 
--- The token's SHA-256 in hexadecimal. A session with an app is for a program and has the role of its own; a person's
--- has its account's. The address is empty when the session may be used from any. A duration of 0 has no end.
+-- The token's SHA-256 in hexadecimal. The address is empty when the session may be used from any. The duration is in
+-- seconds, 0 for no end; NULL for a person's session, which has the role of its account and the limits of the settings.
 CREATE TABLE sessions (
     id INTEGER PRIMARY KEY AUTOINCREMENT,
     token_hash TEXT NOT NULL UNIQUE,
@@ -176,12 +176,12 @@ CREATE TABLE sessions (
     app TEXT NOT NULL DEFAULT '',
     opened_from TEXT NOT NULL,
     address TEXT NOT NULL,
-    duration INTEGER NOT NULL DEFAULT 0,
+    duration INTEGER,
     created INTEGER NOT NULL,
     last_used INTEGER NOT NULL
 ) STRICT;
 
--- Failed log-ins since the last good one, and when the next is looked at.
+-- Failed log-ins, and when the last was.
 CREATE TABLE login_failures (
     kind TEXT NOT NULL CHECK (kind IN ('account', 'address')),
     key TEXT NOT NULL,
@@ -216,6 +216,54 @@ CREATE TABLE pins (
     port INTEGER NOT NULL CHECK (port BETWEEN 1 AND 65535),
     pin TEXT NOT NULL,
     PRIMARY KEY (host, port)
+) STRICT, WITHOUT ROWID;
+
+-- Halves of replications. The latest sending from here, what arrives here (which state, and below which place of its LUN
+-- it is flushed), and the latest count of unsynchronised bytes.
+CREATE TABLE replication_tasks (
+    id INTEGER PRIMARY KEY,
+    uuid TEXT NOT NULL UNIQUE,
+    is_source INTEGER NOT NULL CHECK (is_source IN (0, 1)),
+    src_lun TEXT NOT NULL,
+    dst_lun TEXT NOT NULL,
+    src_node TEXT NOT NULL,
+    dst_node TEXT NOT NULL,
+    root_path TEXT NOT NULL,
+    parent_task TEXT NOT NULL,
+    sent INTEGER NOT NULL DEFAULT 0,
+    total INTEGER NOT NULL DEFAULT 0,
+    progress INTEGER NOT NULL DEFAULT 0,
+    error INTEGER NOT NULL DEFAULT 0,
+    arriving TEXT NOT NULL DEFAULT '',
+    arrived INTEGER NOT NULL DEFAULT 0,
+    unsync_bytes INTEGER NOT NULL DEFAULT 0,
+    unsync_completed INTEGER NOT NULL DEFAULT 0,
+    unsync_error INTEGER NOT NULL DEFAULT 0
+) STRICT;
+CREATE UNIQUE INDEX sinks_of_tasks ON replication_tasks (dst_lun) WHERE NOT is_source;
+
+-- Sink LUNs that a peer may write now, through a target that bears a new name each time, and when a session of its was
+-- last seen there.
+CREATE TABLE sinks (
+    lid INTEGER PRIMARY KEY REFERENCES luns ON DELETE RESTRICT,
+    iqn TEXT NOT NULL UNIQUE,
+    seen INTEGER NOT NULL
+) STRICT;
+
+-- LUNs on their way to a sink of a node. The sink's target is empty while none is open for us. An errno value is the
+-- state of a transfer that ended otherwise than complete; bytes are those of the ended transfer.
+CREATE TABLE virtual_luns (
+    uuid TEXT PRIMARY KEY,
+    lid INTEGER NOT NULL REFERENCES luns ON DELETE RESTRICT,
+    kind INTEGER NOT NULL,
+    node TEXT NOT NULL DEFAULT '',
+    portal TEXT NOT NULL DEFAULT '',
+    sink TEXT NOT NULL DEFAULT '',
+    sink_iqn TEXT NOT NULL DEFAULT '',
+    moved INTEGER NOT NULL DEFAULT 0,
+    total INTEGER NOT NULL DEFAULT 0,
+    ended INTEGER NOT NULL DEFAULT 0 CHECK (ended IN (0, 1)),
+    state INTEGER NOT NULL DEFAULT 0
 ) STRICT, WITHOUT ROWID;
 )sql",
 };
