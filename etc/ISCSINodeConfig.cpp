@@ -196,7 +196,8 @@ int ISCSINodeInfo::ListNodeFromConfig(std::vector<ISCSINodeInfo> &out)
     if (int err = lock.release())
         return err;
     for (int i = 0; i < names->count; ++i) {
-        ISCSINodeInfo node(NLIBCSzListGet(names.get(), i));
+        const char *name = NLIBCSzListGet(names.get(), i);
+        ISCSINodeInfo node(name ? name : "");
         if (node.loadFromConfig())
             return failText(here(), ERR_FAILED_TO_LOAD_NODE_CONFIG, "Failed to load node info: %s, errno=0x%04X",
                             node.uuid.c_str(), static_cast<unsigned int>(NLIBCErrGet()));

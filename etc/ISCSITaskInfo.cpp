@@ -51,14 +51,15 @@ int ISCSITaskInfo::loadFromConfig(_tag_iscsi_task_ &record, bool strict)
     if (uuid.empty())
         return failText(here(), ERR_BAD_REPLICATION_TASK_INFO, "Bad task info. UUID is empty");
     record = {};
-    if (int err = NORViSCSIReplicationTaskConfigGetByUUID(uuid.c_str(), &record))
+    if (int err = NORViSCSIReplicationTaskConfGetByUUID(uuid.c_str(), &record))
         return failText(here(), err, "Failed to load replication task: %s", uuid.c_str());
     const std::string selected = uuid;
     *this = fromRecord(record);
     uuid = selected;
 
+    // A LUN that is gone is told below, or no failure.
     _tag_iscsi_lun_ lun{};
-    if (int err = (is_source ? src_lun : dst_lun).loadFromConfig(lun, strict); err && strict)
+    if (int err = (is_source ? src_lun : dst_lun).loadFromConfig(lun, ISCSILUNInfo::LOAD_QUIET); err && strict)
         return failText(here(), err,
                         is_source ? "Failed to load source LUN. task: %s" : "Failed to load destination LUN. task: %s",
                         uuid.c_str());
@@ -117,16 +118,20 @@ int ISCSITaskInfo::fillVISCSITask(_tag_iscsi_task_ &record)
         return failText(here(), ERR_BAD_REPLICATION_TASK_INFO, "Bad task info: %s", toString().c_str());
     record = {};
     record.is_source = is_source;
-    if (int err = StringCopy(record.uuid, uuid))
-        return failText(here(), err, "Failed to copy UUID. task: %s", toString().c_str());
-    if (int err = StringCopy(record.src_lun_uuid, src_lun.uuid))
-        return failText(here(), err, "Failed to copy UUID. task: %s", toString().c_str());
-    if (int err = StringCopy(record.dst_lun_uuid, dst_lun.uuid))
-        return failText(here(), err, "Failed to copy UUID. task: %s", toString().c_str());
-    if (int err = StringCopy(record.src_node_uuid, src_node.uuid))
-        return failText(here(), err, "Failed to copy UUID. task: %s", toString().c_str());
-    if (int err = StringCopy(record.dst_node_uuid, dst_node.uuid))
-        return failText(here(), err, "Failed to copy UUID. task: %s", toString().c_str());
+    const struct {
+        char (&field)[37];
+        const std::string &value;
+    } uuids[] = {
+        {record.uuid, uuid},
+        {record.src_lun_uuid, src_lun.uuid},
+        {record.dst_lun_uuid, dst_lun.uuid},
+        {record.src_node_uuid, src_node.uuid},
+        {record.dst_node_uuid, dst_node.uuid},
+    };
+    for (const auto &copy : uuids) {
+        if (int err = StringCopy(copy.field, copy.value))
+            return failText(here(), err, "Failed to copy UUID. task: %s", toString().c_str());
+    }
     if (int err = StringCopy(record.root_path, root_path))
         return failText(here(), err, "Failed to copy UUID. task: %s", toString().c_str());
     if (int err = StringCopy(record.parent_task_uuid, parent_task_uuid))

@@ -68,8 +68,9 @@ struct TaskRecords {
     TaskRecord takeFirst()
     {
         _tag_iscsi_task_ *record = head.forward;
-        if (record)
-            remque(record);
+        if (!record || record == &head) // a queue ends in null, or is a ring
+            return nullptr;
+        remque(record);
         return TaskRecord(record);
     }
 };

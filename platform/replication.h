@@ -64,7 +64,7 @@ NORV_BEGIN_DECLS
 
 // Every function below returns 0 on success, else an error code.
 
-NORV_API int NORViSCSIReplicationTaskConfigGetByUUID(const char *uuid, _tag_iscsi_task_ *task);
+NORV_API int NORViSCSIReplicationTaskConfGetByUUID(const char *uuid, _tag_iscsi_task_ *task);
 
 /// Links the tasks into the queue behind `head`, whose own fields are not used, and counts them. Each
 /// element is from the C allocator; the caller unlinks and frees it, also after a failure.

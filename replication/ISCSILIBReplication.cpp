@@ -9,15 +9,25 @@ namespace ISCSI::LIB::LIBReplication {
 namespace {
 
 constexpr const char *LOCK_FOLDER = "/tmp/iscsi";
+constexpr int NO_LOCK = -1;
 
-/// The task's lock file, in a folder that exists.
-int prepareLock(const ISCSITaskInfo &task, std::string &path, Site site)
+/// Takes the lock again, or for the first time: then with `take`, which is given the lock file's path.
+template <class Take>
+int lock(ISCSILIBReplication &replication, Take take, Site site)
 {
-    path = task.getLockPath();
+    const std::string path = replication.task.getLockPath();
     if (path.empty())
-        return fail(ERR_BAD_REPLICATION_TASK_UUID, task, "Failed to get task lock file path", site);
+        return fail(ERR_BAD_REPLICATION_TASK_UUID, replication.task, "Failed to get task lock file path", site);
+    if (replication.lock_fd >= 0) {
+        ++replication.lock_depth;
+        return 0;
+    }
     if (NORVFSMkdirP(LOCK_FOLDER, 0, 1, -1, -1, -1) < 0)
-        return fail(ERR_FAILED_TO_CERATE_DIRECTORY, task, "Failed to create iscsi lock folder", site);
+        return fail(ERR_FAILED_TO_CERATE_DIRECTORY, replication.task, "Failed to create iscsi lock folder", site);
+    int fd = NO_LOCK;
+    if (int err = take(path.c_str(), &fd))
+        return err;
+    replication.lock_fd = fd;
     return 0;
 }
 
@@ -46,33 +56,25 @@ ISCSILIBReplication::~ISCSILIBReplication() = default;
 
 int ISCSILIBReplication::lockTask()
 {
-    std::string path;
-    if (lock_fd >= 0) {
-        ++lock_depth;
-        return 0;
-    }
-    if (int err = prepareLock(task, path, here()))
-        return err;
-    if (!NLIBCFileLockByFile(path.c_str(), 1, &lock_fd))
-        return fail(ERR_TASK_IS_LOCKED, task, "Another process locked this task");
-    return 0;
+    const auto take = [this, site = here()](const char *path, int *fd) {
+        return NLIBCFileLockByFile(path, 1, fd)
+                   ? 0
+                   : fail(ERR_TASK_IS_LOCKED, task, "Another process locked this task", site);
+    };
+    return lock(*this, take, here());
 }
 
 int ISCSILIBReplication::blockingLockTask()
 {
-    constexpr int ONE_DAY = 86400;
-    std::string path;
-    if (lock_fd >= 0) {
-        ++lock_depth;
-        return 0;
-    }
-    if (int err = prepareLock(task, path, here()))
-        return err;
-    for (int second = 0; second < ONE_DAY; ++second) {
-        if (NLIBCFileLockTimeByFile(path.c_str(), 1, 1, &lock_fd) == 1)
-            return 0;
-    }
-    return fail(ERR_TIMEOUT, task, "Timeout. Failed to wait until get blocking task");
+    const auto take = [this, site = here()](const char *path, int *fd) {
+        constexpr int ONE_DAY = 86400;
+        for (int second = 0; second < ONE_DAY; ++second) {
+            if (NLIBCFileLockTimeByFile(path, 1, 1, fd) == 1)
+                return 0;
+        }
+        return fail(ERR_TIMEOUT, task, "Timeout. Failed to wait until get blocking task", site);
+    };
+    return lock(*this, take, here());
 }
 
 int ISCSILIBReplication::unlockTask()
@@ -85,7 +87,7 @@ int ISCSILIBReplication::unlockTask()
     }
     if (!NLIBCFileUnlockByFile(lock_fd))
         fail(0, task, "Failed to unlock task");
-    lock_fd = -1;
+    lock_fd = NO_LOCK;
     return 0;
 }
 

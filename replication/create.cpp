@@ -32,6 +32,7 @@ int ISCSILIBReplication::createReplication()
     ISCSINodeInfo node = task.dst_node;
     if (int err = node.loadFromDRNode())
         return fail(err, task, "Failed to load destination node's info");
+    task.dst_node = node; // the wait below asks it
     WebAPIClientLUNCreate create(node, dst_lun_name, NORV_LUN_TYPE_SINK, dst_lun_location, task.src_lun.size,
                                  DESTINATION_EXTENT_SIZE);
     if (int err = create.send())

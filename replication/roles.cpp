@@ -16,6 +16,8 @@ int ISCSILIBReplication::getStatus(bool &is_locked, std::string &base_version)
 {
     if (int err = loadTask(true))
         return fail(err, task, "Failed to load replication task");
+    // A lock whose folder is missing could not be taken, and would pass for one that is held.
+    NORVFSMkdirP("/tmp/iscsi", 0, 1, -1, -1, -1);
     int fd = -1;
     const bool locked = !NLIBCFileLockByFile(task.getLockPath().c_str(), 1, &fd);
     if (!locked && !NLIBCFileUnlockByFile(fd))
@@ -51,7 +53,8 @@ int changeRole(ISCSILIBReplication &replication, const RoleChange &change, Site 
     if (int err = ISCSILIBLUN((task.is_source ? task.src_lun : task.dst_lun).uuid).isLUNMapped(mapped))
         return fail(err, task, "Failed to get LUN status", site);
     if (mapped)
-        return fail(ERR_LUN_IS_MAPPED, task, "LUN is mapped. Please unmap the target.", site);
+        return failText(site, ERR_LUN_IS_MAPPED, "LUN is mapped. Please unmap the target. info: %s. error: %d (%s)",
+                        task.toString().c_str(), ERR_LUN_IS_MAPPED, ErrorCodeToString(ERR_LUN_IS_MAPPED));
     if (int err = change.convert(&replication.task_record))
         return fail(err, task, change.failure, site);
     return 0;

@@ -97,7 +97,7 @@ int ISCSILIBReplication::waitUntilSendingCompleted(int &retries_left, unsigned l
         }
         if (progress.sent_size != 0 && progress.sent_size == progress.send_total_size)
             return 0;
-        if (wait.stalled(progress.sent_size))
+        if (wait.stalled(progress.sent_size + progress.progress_value))
             return fail(ERR_TIMEOUT, task, "Timeout! Failed to wait until sending snapshot completed");
     }
 }

@@ -43,8 +43,10 @@ Client::~Client() = default;
 
 int Client::send()
 {
-    if (auto failure = called(method, node.uuid, path))
+    if (auto failure = called(method, node.hostname.empty() ? node.uuid : node.hostname, path))
         return *failure;
+    if (node.hostname.empty() && !node.is_local_node)
+        return NORV_ERR_BAD_PARAMETER; // nowhere to send it
     readResponse(Json::Value());
     return 0;
 }

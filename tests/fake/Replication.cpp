@@ -98,7 +98,7 @@ int NORViSCSIVirtualLunFillByUUID(const char *uuid, _tag_viscsi_virtual_lun_ *vl
     return copyRecord(known ? &known->record : nullptr, vlun, NORV_ERR_VLUN_UUID);
 }
 
-int NORViSCSIReplicationTaskConfigGetByUUID(const char *uuid, _tag_iscsi_task_ *record)
+int NORViSCSIReplicationTaskConfGetByUUID(const char *uuid, _tag_iscsi_task_ *record)
 {
     if (auto failure = called(__func__, uuid))
         return *failure;
