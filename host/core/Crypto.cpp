@@ -3,6 +3,7 @@
 #include <cstdint>
 #include <nettle/base64.h>
 #include <nettle/hmac.h>
+#include <nettle/memops.h>
 #include <nettle/sha2.h>
 #include <sys/random.h>
 
@@ -52,6 +53,11 @@ std::string hmacSha256(std::string_view key, std::string_view data)
     return digest;
 }
 
+bool sameBytes(std::string_view left, std::string_view right)
+{
+    return left.size() == right.size() && memeql_sec(left.data(), right.data(), left.size());
+}
+
 std::string toHex(std::string_view bytes)
 {
     constexpr char digits[] = "0123456789abcdef";
@@ -61,6 +67,26 @@ std::string toHex(std::string_view bytes)
         text += digits[static_cast<uint8_t>(byte) >> 4];
         text += digits[static_cast<uint8_t>(byte) & 15];
     }
+    return text;
+}
+
+std::string fromBase64(std::string_view text)
+{
+    base64_decode_ctx context;
+    base64_decode_init(&context);
+    std::string bytes(BASE64_DECODE_LENGTH(text.size()), '\0');
+    size_t size = bytes.size();
+    if (!base64_decode_update(&context, &size, bytesOf(bytes), text.size(), text.data()) ||
+        !base64_decode_final(&context))
+        return "";
+    bytes.resize(size);
+    return bytes;
+}
+
+std::string toBase64(std::string_view bytes)
+{
+    std::string text(BASE64_ENCODE_RAW_LENGTH(bytes.size()), '\0');
+    base64_encode_raw(text.data(), bytes.size(), bytesOf(bytes));
     return text;
 }
 

@@ -16,8 +16,17 @@ std::string sha256(std::string_view data);
 /// HMAC-SHA256 (RFC 2104), 32 bytes.
 std::string hmacSha256(std::string_view key, std::string_view data);
 
+/// Compares in a time that tells nothing of where two secrets differ.
+bool sameBytes(std::string_view left, std::string_view right);
+
 /// Two lower-case digits a byte.
 std::string toHex(std::string_view bytes);
+
+/// RFC 4648, with padding.
+std::string toBase64(std::string_view bytes);
+
+/// What a text in base64 stands for, line breaks skipped; empty for what is none.
+std::string fromBase64(std::string_view text);
 
 /// RFC 4648's alphabet for URLs and file names, without padding.
 std::string toBase64Url(std::string_view bytes);

@@ -25,6 +25,8 @@ public:
         fd = other;
     }
     int get() const { return fd; }
+    /// The caller closes it.
+    int release() { return std::exchange(fd, -1); }
     explicit operator bool() const { return fd >= 0; }
 
 private:

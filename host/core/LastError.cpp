@@ -1,6 +1,7 @@
 #include "host/core/LastError.h"
 
 #include "iscsihost/host.h"
+#include "platform/core.h"
 #include "platform/error.h"
 
 #include <cerrno>
@@ -12,6 +13,7 @@ namespace norvhost {
 namespace {
 
 thread_local char reason[1024];
+thread_local int latest_code;
 
 void record(const char *format, va_list arguments)
 {
@@ -22,26 +24,9 @@ void record(const char *format, va_list arguments)
             *c = '?';
 }
 
-} // namespace
-
-int fail(int code, const char *format, ...)
+/// Where the errno value says more than the code does, that.
+int codeOf(int errnum, int code)
 {
-    va_list arguments;
-    va_start(arguments, format);
-    record(format, arguments);
-    va_end(arguments);
-    return code;
-}
-
-int failErrno(int code, int errnum, const char *format, ...)
-{
-    va_list arguments;
-    va_start(arguments, format);
-    record(format, arguments);
-    va_end(arguments);
-    const size_t used = strlen(reason);
-    snprintf(reason + used, sizeof reason - used, ": %s", strerror(errnum));
-
     switch (errnum) {
     case ENOSPC:
     case EDQUOT:
@@ -57,12 +42,45 @@ int failErrno(int code, int errnum, const char *format, ...)
     }
 }
 
+} // namespace
+
+int fail(int code, const char *format, ...)
+{
+    va_list arguments;
+    va_start(arguments, format);
+    record(format, arguments);
+    va_end(arguments);
+    return latest_code = code;
+}
+
+int failErrno(int code, int errnum, const char *format, ...)
+{
+    va_list arguments;
+    va_start(arguments, format);
+    record(format, arguments);
+    va_end(arguments);
+    const size_t used = strlen(reason);
+    snprintf(reason + used, sizeof reason - used, ": %s", strerror(errnum));
+
+    return latest_code = codeOf(errnum, code);
+}
+
 const char *lastError()
 {
     return reason;
 }
 
+int lastErrorCode()
+{
+    return latest_code;
+}
+
 } // namespace norvhost
+
+int NLIBCErrGet(void)
+{
+    return norvhost::lastErrorCode();
+}
 
 extern "C" const char *iscsi_host_last_error(void)
 {

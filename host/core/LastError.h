@@ -16,4 +16,7 @@ int failErrno(int code, int errnum, const char *format, ...) __attribute__((form
 /// This thread's latest reason, as iscsi_host_last_error().
 const char *lastError();
 
+/// The code that went with it.
+int lastErrorCode();
+
 } // namespace norvhost

@@ -5,16 +5,11 @@
 #pragma once
 
 #include <cstdint>
-#include <iscsihost/host.h>
+#include <iscsihost/account.h>
 #include <string>
 #include <vector>
 
 namespace iscsihost {
-
-enum class AccountRole {
-    viewer, ///< reads
-    admin,  ///< does everything
-};
 
 /// Times are seconds since the epoch.
 struct Session {
@@ -56,8 +51,8 @@ ISCSI_HOST_API int closeSession(int64_t id);
 
 /// How long people's sessions last: 30 minutes after their last use, 24 hours in all, unless set otherwise.
 struct SessionLimits {
-    int64_t idle = 0;     ///< seconds, 60 or more
-    int64_t absolute = 0; ///< seconds, not less than `idle`
+    int64_t idle = 0;     ///< seconds, 60 to a year
+    int64_t absolute = 0; ///< seconds, `idle` to a year
 };
 
 /// Limits hold at once, also for open sessions.
