@@ -27,4 +27,18 @@ inline std::string lowerCase(std::string_view text)
     return result;
 }
 
+/// 8-4-4-4-12 hexadecimal digits, of either case.
+inline bool isUuid(std::string_view text)
+{
+    if (text.size() != 36)
+        return false;
+    for (size_t i = 0; i < text.size(); ++i) {
+        const bool hyphen = i == 8 || i == 13 || i == 18 || i == 23;
+        const bool digit = text[i] != '\0' && strchr("0123456789abcdefABCDEF", text[i]);
+        if (hyphen ? text[i] != '-' : !digit)
+            return false;
+    }
+    return true;
+}
+
 } // namespace norvhost

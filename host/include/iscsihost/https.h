@@ -17,6 +17,8 @@ struct HttpsRequest {
     std::string token;          ///< session token, empty for none
     std::string body;           ///< JSON, empty for none
     std::string pin;            ///< the server's key, as in getPin(); empty: the one pinned for its host and port
+    int connect_seconds = 10;   ///< limit of connecting, TLS included
+    int stall_seconds = 60;     ///< limit of waiting while less than a byte a second moves; a request has no other limit
 };
 
 struct HttpsAnswer {
@@ -25,13 +27,16 @@ struct HttpsAnswer {
     std::string body; ///< bounded: an answer above 64 MiB is refused
 };
 
-/// Sends one request and waits for its answer, with time-outs for connecting and for a transfer that stands still.
-/// Redirections are not followed. The server's key must be the one pinned for its host and port; without a pin its
-/// certificate must be valid for the machine's certificate authorities. Failures have a reason: who could not be
-/// reached, whose key changed (with both fingerprints). No secret is in a reason.
+/// Sends one request and waits for its answer, over TLS 1.2 or later. Redirections are answers like others, and proxies of
+/// the environment are not used. The server's key must be the one pinned for its host and port, and then its certificate
+/// says nothing; without a pin the certificate must be valid, for the host, by the machine's certificate authorities.
+/// Failures have a reason with the host in it, and both keys when the server's has changed; no secret is in it.
+/// - 18990207 (NORV_ERR_CREATE_REQUEST): a field cannot be sent as it is; nothing was sent.
+/// - 18990211 (NORV_ERR_SEND_REQUEST): not reached, not trusted, or no answer in time.
+/// - 18990204 (NORV_ERR_BAD_RESPONSE): the answer is cut short, too large, or no HTTP.
 ISCSI_HOST_API int https(const HttpsRequest &request, HttpsAnswer &answer);
 
-/// The key that a server shows now: SHA-256 of its public key (DER, SubjectPublicKeyInfo) in base64, as
+/// The key that a server shows now, whoever it is: SHA-256 of its public key (DER, SubjectPublicKeyInfo) in base64, as
 /// "sha256//..." - the form that pins have.
 ISCSI_HOST_API int fetchPin(const std::string &host, uint16_t port, std::string &pin);
 
