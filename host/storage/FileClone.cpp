@@ -57,18 +57,6 @@ int punchHole(int fd, uint64_t begin, uint64_t end)
     return 0;
 }
 
-/// Where the next data begins and ends, from `at` on; both the file's size behind the last.
-int nextData(int fd, uint64_t at, uint64_t size, uint64_t &begin, uint64_t &end)
-{
-    const off_t data = lseek(fd, static_cast<off_t>(at), SEEK_DATA);
-    if (data < 0 && errno != ENXIO)
-        return failErrno(NORV_ERR_READ_FILE, errno, "cannot look for data in a file");
-    const off_t hole = data < 0 ? -1 : lseek(fd, data, SEEK_HOLE);
-    begin = data < 0 ? size : std::min(static_cast<uint64_t>(data), size);
-    end = hole < 0 ? size : std::min(static_cast<uint64_t>(hole), size);
-    return 0;
-}
-
 /// Starts writing out what was copied, and waits for what was copied before: the disk works while we read, and neither
 /// the final flush nor a stop has much to wait for.
 class WriteBehind {
@@ -113,7 +101,7 @@ int copyExtents(int from, int to, uint64_t old_size, const BytesProgress &progre
     WriteBehind behind(to);
     std::vector<char> buffer(copy_step);
     for (uint64_t at = 0, begin = 0, end = 0; at < size; at = end) {
-        if (int err = nextData(from, at, size, begin, end))
+        if (int err = findData(from, at, size, begin, end))
             return err;
         if (int err = punchHole(to, at, std::min(begin, old_size)))
             return err;
@@ -166,6 +154,17 @@ int shareBlocks(int from, int to, bool &shared)
                      buffer);
 }
 
+int findData(int fd, uint64_t at, uint64_t size, uint64_t &begin, uint64_t &end)
+{
+    const off_t data = lseek(fd, static_cast<off_t>(at), SEEK_DATA);
+    if (data < 0 && errno != ENXIO)
+        return failErrno(NORV_ERR_READ_FILE, errno, "cannot look for data in a file");
+    const off_t hole = data < 0 ? -1 : lseek(fd, data, SEEK_HOLE);
+    begin = data < 0 ? size : std::min(static_cast<uint64_t>(data), size);
+    end = hole < 0 ? size : std::min(static_cast<uint64_t>(hole), size);
+    return 0;
+}
+
 int countData(int fd, uint64_t &bytes)
 {
     uint64_t size = 0;
@@ -173,7 +172,7 @@ int countData(int fd, uint64_t &bytes)
         return err;
     bytes = 0;
     for (uint64_t at = 0, begin = 0, end = 0; at < size; at = end) {
-        if (int err = nextData(fd, at, size, begin, end))
+        if (int err = findData(fd, at, size, begin, end))
             return err;
         bytes += end - begin;
     }

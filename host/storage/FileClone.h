@@ -19,6 +19,9 @@ using CopyProgress = std::function<int(int percent)>;
 /// The same by copying what is not a hole.
 int copySparsely(int from, int to, const CopyProgress &progress);
 
+/// Where the next data begins and ends, from `at` on; both `size` behind the last.
+int findData(int fd, uint64_t at, uint64_t size, uint64_t &begin, uint64_t &end);
+
 /// Bytes of a file that are not in holes.
 int countData(int fd, uint64_t &bytes);
 

@@ -81,6 +81,11 @@ int lockLun(const _tag_iscsi_lun_ *lun, int action, LunLock &lock, LunRow &row)
         return err;
     if (int err = lockLun(found.record.lid, action, lock, row))
         return err;
+    bool open;
+    if (int err = isSinkOpen(row.record.lid, open))
+        return err;
+    if (open)
+        return fail(NORV_ERR_LUN_LOCKED, "a peer is writing to the LUN '%s'", row.record.name);
     // Between the two reads another LUN may have got the ID.
     return row.record.uuid == std::string_view(found.record.uuid) ? 0 : loadLunByUuid(lun->uuid, row);
 }

@@ -10,7 +10,8 @@
 namespace norvhost {
 
 /// Locks the caller's LUN, then reads its row: what the caller's record says may be old. What a killed action left is
-/// put right first, as far as that can be done now (see requireWhole). NORV_ERR_LUN_LOCKED.
+/// put right first, as far as that can be done now (see requireWhole). NORV_ERR_LUN_LOCKED; by its record, also while a
+/// peer writes to it.
 int lockLun(const _tag_iscsi_lun_ *lun, int action, LunLock &lock, LunRow &row);
 int lockLun(int lid, int action, LunLock &lock, LunRow &row);
 

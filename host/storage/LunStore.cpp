@@ -75,6 +75,15 @@ int refuseMapped(int lid)
     return 0;
 }
 
+int refuseSent(int lid)
+{
+    Query query("SELECT uuid FROM virtual_luns WHERE lid = ?1");
+    if (query.bind(lid).next())
+        return fail(NORV_ERR_LUN_LOCKED, "the virtual LUN %s sends the LUN to another node: remove that first",
+                    std::string(query.text(0)).c_str());
+    return query.error();
+}
+
 } // namespace
 
 int loadLunByLid(int lid, LunRow &row)
@@ -120,6 +129,13 @@ int countMappings(int lid, int &count)
         return query.error();
     count = query.integer(0);
     return 0;
+}
+
+int isSinkOpen(int lid, bool &open)
+{
+    Query query("SELECT 1 FROM sinks WHERE lid = ?1");
+    open = query.bind(lid).next();
+    return query.error();
 }
 
 int insertLun(const LunRow &row)
@@ -168,6 +184,8 @@ int removeLun(int lid)
     if (transaction.error())
         return transaction.error();
     if (int err = refuseMapped(lid))
+        return err;
+    if (int err = refuseSent(lid))
         return err;
     if (int err = removeSnapshotsOfLun(lid))
         return err;

@@ -30,6 +30,9 @@ int countMappings(int lid, int &count);
 /// Whether initiators may be using the LUN: it is mapped and loaded.
 int isInUse(const LunRow &row, bool &in_use);
 
+/// Whether a peer may be writing to the LUN, a sink.
+int isSinkOpen(int lid, bool &open);
+
 /// Adds a row: NORV_ERR_LUN_NAME_EXISTS when another LUN bears the name, NORV_ERR_LUN_LOCATION when the volume was
 /// removed meanwhile or another LUN has the device.
 int insertLun(const LunRow &row);
@@ -39,7 +42,8 @@ int insertLun(const LunRow &row);
 int updateLun(const LunRow &row);
 
 /// Removes the row with the LUN's snapshots, schedules and retention policy; NORV_ERR_LUN_MAPPED while it is mapped,
-/// and the codes of removeSnapshot() while one of its snapshots is locked.
+/// NORV_ERR_LUN_LOCKED while a virtual LUN is over it, and the codes of removeSnapshot() while one of its snapshots is
+/// locked.
 int removeLun(int lid);
 
 /// The beginning and the end of a restore. An empty UUID takes the mark back.

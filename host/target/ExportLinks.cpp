@@ -2,6 +2,7 @@
 
 #include "host/core/LastError.h"
 #include "host/core/Paths.h"
+#include "host/target/Sinks.h"
 #include "platform/error.h"
 
 #include <cerrno>
@@ -51,6 +52,15 @@ int removeUnusedExportLinks()
             return err;
         for (const MappedLun &lun : luns)
             used.insert(exportLink(lun));
+    }
+    targets.clear();
+    if (int err = loadSinkTargets(targets))
+        return err;
+    for (const _tag_iscsi_target_ &target : targets) {
+        MappedLun lun;
+        if (int err = loadSinkLun(target.tid, lun))
+            return err;
+        used.insert(exportLink(lun));
     }
     std::error_code error;
     std::filesystem::directory_iterator entry(exportFolder(), error), end;

@@ -1,13 +1,13 @@
 #include "host/target/Reopen.h"
 
 #include "host/core/LastError.h"
+#include "host/core/PipeSignalBlock.h"
 #include "host/storage/LunStore.h"
 #include "host/target/Wait.h"
 #include "platform/error.h"
 
 #include <arpa/inet.h>
 #include <cerrno>
-#include <csignal>
 #include <cstdio>
 #include <cstring>
 #include <fcntl.h>
@@ -33,33 +33,6 @@ struct EndSession {
     void operator()(iscsi_context *session) const { iscsi_destroy_context(session); }
 };
 using Session = std::unique_ptr<iscsi_context, EndSession>;
-
-/// libiscsi writes to its socket without regard to SIGPIPE, which would end a caller that knows of no socket.
-class PipeSignalBlock {
-public:
-    PipeSignalBlock()
-    {
-        sigset_t waiting;
-        sigemptyset(&pipe_signal);
-        sigaddset(&pipe_signal, SIGPIPE);
-        sigpending(&waiting);
-        was_waiting = sigismember(&waiting, SIGPIPE);
-        pthread_sigmask(SIG_BLOCK, &pipe_signal, &before);
-    }
-    ~PipeSignalBlock()
-    {
-        const timespec now = {};
-        if (!was_waiting)
-            sigtimedwait(&pipe_signal, nullptr, &now);
-        pthread_sigmask(SIG_SETMASK, &before, nullptr);
-    }
-    PipeSignalBlock(const PipeSignalBlock &) = delete;
-    PipeSignalBlock &operator=(const PipeSignalBlock &) = delete;
-
-private:
-    sigset_t pipe_signal, before;
-    bool was_waiting;
-};
 
 /// Lets a name in for as long as the object lives. What a killed process leaves goes at the next reconcile.
 class TemporaryInitiator {

@@ -1,5 +1,6 @@
 #include "host/target/Service.h"
 
+#include "host/core/BootMark.h"
 #include "host/core/FileDescriptor.h"
 #include "host/core/LastError.h"
 #include "host/core/Paths.h"
@@ -10,6 +11,7 @@
 #include "host/target/ProcessLock.h"
 #include "host/target/Reconcile.h"
 #include "host/target/ServiceLock.h"
+#include "host/target/Sinks.h"
 #include "host/target/TargetStore.h"
 #include "host/target/Tgtd.h"
 #include "host/target/Wait.h"
@@ -256,7 +258,10 @@ int startMissing()
     if (changed)
         if (int err = reconcileBoth(lock))
             return err;
-    return processLockHolder(portalLockPath()) > 0 ? 0 : startPortal();
+    if (processLockHolder(portalLockPath()) <= 0)
+        if (int err = startPortal())
+            return err;
+    return markBooted();
 }
 
 /// Process descriptors of all that runs.
@@ -337,6 +342,8 @@ int superviseService()
         // Initiators are not to work for long on a LUN whose restore was cut short. mendRestores() logs its failures.
         if (std::chrono::steady_clock::now() >= next_mend) {
             mendRestores();
+            if (int err = closeAbandonedSinks())
+                syslog(LOG_ERR, "an abandoned sink stays open (%d): %s", err, lastError());
             next_mend = std::chrono::steady_clock::now() + mend_interval;
         }
         cutMessages();

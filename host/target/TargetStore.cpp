@@ -6,6 +6,7 @@
 #include "host/storage/MapFile.h"
 #include "host/storage/SnapshotStore.h"
 #include "host/target/Name.h"
+#include "host/target/Sinks.h"
 #include "platform/error.h"
 
 #include <algorithm>
@@ -261,6 +262,8 @@ int loadUsers(std::map<std::string, std::string> &users)
 {
     std::vector<_tag_iscsi_target_> targets;
     if (int err = loadTargets(targets))
+        return err;
+    if (int err = loadSinkTargets(targets))
         return err;
     users.clear();
     for (const _tag_iscsi_target_ &target : targets) {

@@ -62,7 +62,7 @@ int loadMasking(int tid, Masking &masking);
 int storeMaskingEntry(const _tag_struct_iscsi_acl_ &entry);
 int deleteMaskingEntry(int tid, std::string_view iqn);
 
-/// CHAP users of all targets, in either direction, with their secrets.
+/// CHAP users of all targets and open sinks, in either direction, with their secrets.
 int loadUsers(std::map<std::string, std::string> &users);
 
 } // namespace norvhost

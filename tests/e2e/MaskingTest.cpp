@@ -170,7 +170,7 @@ TEST_F(MaskingTest, NoCommandWritesThroughAReadersSession)
     EXPECT_TRUE(writer.holds(0, 0xaa, 1, 64));
 }
 
-TEST_F(MaskingTest, ASinkIsShownToReadersOnly)
+TEST_F(MaskingTest, ASinkIsForReadersOnly)
 {
     const _tag_iscsi_lun_ sink = createLun("sink", 16 * MiB, NORV_LUN_TYPE_SINK), plain = createLun("plain");
     const _tag_iscsi_target_ target = createTarget("both");
@@ -180,9 +180,12 @@ TEST_F(MaskingTest, ASinkIsShownToReadersOnly)
     mask(target.tid, bob, NORV_AUTHORITY_READ);
     Initiator writer(alice), reader(bob);
     ASSERT_TRUE(writer.logIn(target.iqn) && reader.logIn(target.iqn));
-    EXPECT_EQ(writer.luns(), std::vector<int>{2});
-    EXPECT_EQ(reader.luns(), (std::vector<int>{1, 2}));
-    EXPECT_FALSE(reader.write(0, 1, 1));
+    for (Initiator *initiator : {&writer, &reader}) {
+        EXPECT_EQ(initiator->luns(), (std::vector<int>{1, 2}));
+        EXPECT_FALSE(initiator->write(0, 1, 1));
+        EXPECT_TRUE(initiator->holds(0, 0, 1));
+    }
+    EXPECT_TRUE(writer.write(0, 1, 2));
 }
 
 TEST_F(MaskingTest, NoMoreSessionsThanAllowed)

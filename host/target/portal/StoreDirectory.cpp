@@ -3,6 +3,7 @@
 #include "host/core/LastError.h"
 #include "host/target/Name.h"
 #include "host/target/ServiceLock.h"
+#include "host/target/Sinks.h"
 #include "host/target/TargetStore.h"
 #include "platform/error.h"
 
@@ -51,9 +52,12 @@ LoginStatus look(const std::string &initiator, const std::string &wanted, _tag_i
     std::string name;
     if (!normaliseTargetName(wanted, name))
         return login_not_found;
-    if (const int err = loadTargetByIqn(name, target))
+    int err = loadTargetByIqn(name, target);
+    if (err == NORV_ERR_NO_SUCH_TARGET)
+        err = loadSinkTargetByIqn(name, target);
+    if (err)
         return err == NORV_ERR_NO_SUCH_TARGET ? login_not_found : login_service_unavailable;
-    if (loadMasking(target.tid, masking))
+    if (isSinkTid(target.tid) ? loadSinkMasking(target.tid, masking) : loadMasking(target.tid, masking))
         return login_service_unavailable;
     Access access;
     if (!accessFor(masking.of(initiator), access))

@@ -1,0 +1,441 @@
+#include "host/transfer/Sending.h"
+
+#include "host/core/LastError.h"
+#include "host/core/PipeSignalBlock.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <chrono>
+#include <cstring>
+#include <deque>
+#include <fcntl.h>
+#include <iscsi/iscsi.h>
+#include <iscsi/scsi-lowlevel.h>
+#include <memory>
+#include <poll.h>
+#include <sys/mman.h>
+#include <unistd.h>
+#include <vector>
+
+namespace norvhost {
+namespace {
+
+using Clock = std::chrono::steady_clock;
+using namespace std::chrono_literals;
+
+constexpr uint32_t block_size = 512;
+
+/// Larger requests are slower: they leave the processor's cache between the steps.
+constexpr size_t request_size = 256 << 10;
+constexpr size_t requests_max = 64;
+
+/// tgtd frees nothing for 4 GiB in one descriptor.
+constexpr uint64_t unmap_max = 1 << 30;
+
+/// What the disk is asked for before it is needed.
+constexpr uint64_t readahead = 16 << 20;
+
+constexpr auto login_limit = 15s, stall_limit = 60s, flush_limit = 600s, logout_limit = 2s;
+constexpr auto progress_interval = 100ms;
+constexpr int keepalive_seconds = 10, keepalive_count = 3;
+
+/// Commands that are begun before the connection is served again.
+constexpr int issues_at_once = 8;
+constexpr size_t planned_max = 8192;
+
+struct Destroy {
+    void operator()(iscsi_context *iscsi) const { iscsi_destroy_context(iscsi); }
+};
+
+struct FreeTask {
+    void operator()(scsi_task *task) const { scsi_free_scsi_task(task); }
+};
+
+class Buffers {
+public:
+    Buffers()
+        : memory(mmap(nullptr, requests_max * request_size, PROT_READ | PROT_WRITE, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0))
+    {
+    }
+    ~Buffers()
+    {
+        if (*this)
+            munmap(memory, requests_max * request_size);
+    }
+    Buffers(const Buffers &) = delete;
+    Buffers &operator=(const Buffers &) = delete;
+
+    explicit operator bool() const { return memory != MAP_FAILED; }
+    unsigned char *at(size_t i) const { return static_cast<unsigned char *>(memory) + i * request_size; }
+
+private:
+    void *memory;
+};
+
+/// A range, and the bytes of data in it: those that turn out to be zeros are data to whoever counts.
+struct Piece : DataRange {
+    uint64_t data = 0;
+};
+
+bool isZero(const unsigned char *data, size_t size)
+{
+    return size == 0 || (data[0] == 0 && memcmp(data, data + 1, size - 1) == 0);
+}
+
+/// The errno value that says what a failed command means.
+int meaning(int status, const scsi_task *task)
+{
+    constexpr int space_allocation_failed = 0x2707; // SPC-4, annex D
+    if (status != SCSI_STATUS_CHECK_CONDITION || !task)
+        return status == SCSI_STATUS_CANCELLED ? ECONNRESET : EIO;
+    if (task->sense.key != SCSI_SENSE_DATA_PROTECTION)
+        return EIO;
+    return task->sense.ascq == space_allocation_failed ? ENOSPC : EROFS;
+}
+
+class Sender {
+public:
+    explicit Sender(const Sending &sending) : sending(sending) {}
+    ~Sender()
+    {
+        ending = true;
+        session.reset(); // commands under way end now, and tell us
+    }
+    Sender(const Sender &) = delete;
+    Sender &operator=(const Sender &) = delete;
+
+    int run();
+
+private:
+    /// A command under way.
+    struct Request {
+        Sender *sender;
+        unsigned char *buffer;
+        Piece piece;
+    };
+
+    int logIn();
+    int checkUnit();
+    int stream();
+    int plan();
+    int issue();
+    int write(const Piece &piece);
+    int unmapGathered();
+    int began(Request *request, const scsi_task *task);
+    int flush();
+    void logOut();
+
+    Request *takeRequest(const Piece &piece);
+    /// Serves the connection once, for at most a tenth of a second, and not at all long when `busy`. It fails when
+    /// nothing moved for the limit.
+    int serve(bool busy, Clock::duration limit);
+    int awaitAnswer(Clock::duration limit);
+    int tell();
+    int connectionFailed(int errnum);
+
+    static void connected(iscsi_context *, int status, void *, void *sender);
+    static void answered(iscsi_context *, int status, void *task, void *sender);
+    static void ended(iscsi_context *, int status, void *task, void *request);
+
+    const Sending &sending;
+    const Buffers buffers;
+    std::vector<Request> requests;
+    std::vector<Request *> idle;
+
+    DataRange rest; ///< of the range that the source gave last
+    bool source_ended = false;
+    std::deque<Piece> planned; ///< what comes next; the disk was asked for it
+    uint64_t planned_data = 0;
+    Piece gathered; ///< adjoining zeros, to be unmapped
+
+    uint64_t moved = 0, capacity = 0;
+    Clock::time_point last_movement, last_told;
+    bool answer_came = false, ending = false;
+    int answer_status = 0, failure = 0;
+    std::unique_ptr<iscsi_context, Destroy> session;
+};
+
+int Sender::run()
+{
+    if (!buffers)
+        return fail(-ENOMEM, "no memory for sending");
+    requests.resize(requests_max);
+    for (size_t i = 0; i < requests_max; ++i) {
+        requests[i].sender = this;
+        requests[i].buffer = buffers.at(i);
+        idle.push_back(&requests[i]);
+    }
+    for (const auto step : {&Sender::logIn, &Sender::checkUnit, &Sender::stream, &Sender::flush})
+        if (int err = (this->*step)())
+            return err;
+    logOut();
+    return sending.progress ? sending.progress(moved) : 0;
+}
+
+int Sender::logIn()
+{
+    const IscsiUnit &to = sending.to;
+    session.reset(iscsi_create_context(to.initiator.c_str()));
+    iscsi_context *const iscsi = session.get();
+    if (!iscsi)
+        return fail(-ENOMEM, "no memory for an iSCSI session");
+    iscsi_set_session_type(iscsi, ISCSI_SESSION_NORMAL);
+    iscsi_set_targetname(iscsi, to.target.c_str());
+    iscsi_set_header_digest(iscsi, ISCSI_HEADER_DIGEST_NONE);
+    // A request's data goes along with it, without asking.
+    iscsi_set_initial_r2t(iscsi, ISCSI_INITIAL_R2T_NO);
+    iscsi_set_immediate_data(iscsi, ISCSI_IMMEDIATE_DATA_YES);
+    iscsi_set_noautoreconnect(iscsi, 1);
+    iscsi_set_tcp_keepalive(iscsi, keepalive_seconds, keepalive_count, keepalive_seconds);
+    iscsi_set_timeout(iscsi, 0); // a slow line is no failure: serve() sees when nothing moves
+    if (!to.user.empty())
+        iscsi_set_initiator_username_pwd(iscsi, to.user.c_str(), to.secret.c_str());
+    if (!to.mutual_user.empty())
+        iscsi_set_target_username_pwd(iscsi, to.mutual_user.c_str(), to.mutual_secret.c_str());
+
+    answer_came = false;
+    if (iscsi_full_connect_async(iscsi, to.portal.c_str(), to.lun, connected, this) != 0)
+        return connectionFailed(ECONNREFUSED);
+    const int err = awaitAnswer(login_limit);
+    if (err == -ECONNRESET || answer_status != SCSI_STATUS_GOOD) {
+        // Which step failed is told by its text only.
+        const bool refused = strstr(iscsi_get_error(iscsi), "log in to target") != nullptr;
+        return err == 0 || err == -ECONNRESET ? connectionFailed(refused ? EACCES : ECONNREFUSED) : err;
+    }
+    return err;
+}
+
+int Sender::connectionFailed(int errnum)
+{
+    return fail(-errnum, "cannot log in to %s at %s: %s", sending.to.target.c_str(), sending.to.portal.c_str(),
+                iscsi_get_error(session.get()));
+}
+
+int Sender::checkUnit()
+{
+    // The first answers after a log-in may be unit attentions.
+    for (int tries = 0; tries < 3 && capacity == 0; ++tries) {
+        answer_came = false;
+        if (!iscsi_readcapacity16_task(session.get(), sending.to.lun, answered, this))
+            return fail(-ENOMEM, "no memory for an iSCSI command");
+        if (int err = awaitAnswer(login_limit))
+            return err;
+    }
+    if (capacity == 0)
+        return fail(-ENXIO, "the unit %d of %s tells no size: %s", sending.to.lun, sending.to.target.c_str(),
+                    iscsi_get_error(session.get()));
+    return 0;
+}
+
+int Sender::stream()
+{
+    last_movement = Clock::now();
+    for (;;) {
+        if (int err = plan())
+            return err;
+        const bool all_issued = planned.empty() && gathered.length == 0;
+        if (all_issued && idle.size() == requests_max)
+            return 0;
+        // In small portions: the connection is to be served meanwhile. Zeros may need a request of their own.
+        bool busy = false;
+        for (int i = 0; i < issues_at_once && idle.size() >= 2 && !(planned.empty() && gathered.length == 0); ++i) {
+            if (int err = issue())
+                return err;
+            busy = true;
+        }
+        if (idle.size() == requests_max)
+            last_movement = Clock::now(); // nothing is under way
+        if (int err = serve(busy, stall_limit))
+            return err;
+    }
+}
+
+int Sender::plan()
+{
+    while (planned_data < readahead && planned.size() < planned_max) {
+        if (rest.length == 0) {
+            if (source_ended)
+                return 0;
+            if (int err = sending.next(rest))
+                return err;
+            source_ended = rest.length == 0;
+            if (rest.offset % block_size || rest.length % block_size || rest.offset + rest.length > capacity)
+                return fail(-ENXIO, "the unit %d of %s has %llu bytes: it is too small", sending.to.lun,
+                            sending.to.target.c_str(), static_cast<unsigned long long>(capacity));
+            continue;
+        }
+        Piece piece;
+        piece.offset = rest.offset;
+        piece.zeros = rest.zeros;
+        piece.length = std::min<uint64_t>(rest.length, rest.zeros ? unmap_max : request_size);
+        piece.data = rest.zeros ? 0 : piece.length;
+        rest.offset += piece.length;
+        rest.length -= piece.length;
+        planned_data += piece.data;
+        planned.push_back(piece);
+        if (!piece.zeros)
+            posix_fadvise(sending.from, static_cast<off_t>(piece.offset), static_cast<off_t>(piece.length),
+                          POSIX_FADV_WILLNEED);
+    }
+    return 0;
+}
+
+/// Begins at most one command.
+int Sender::issue()
+{
+    if (planned.empty())
+        return unmapGathered();
+    Piece &piece = planned.front();
+    if (!piece.zeros) {
+        unsigned char *const buffer = idle.back()->buffer;
+        const ssize_t count = pread(sending.from, buffer, piece.length, static_cast<off_t>(piece.offset));
+        if (count != static_cast<ssize_t>(piece.length))
+            return failErrno(-EIO, count < 0 ? errno : EIO, "cannot read what is to be sent");
+        piece.zeros = isZero(buffer, piece.length);
+    }
+    if (piece.zeros && sending.to_zeros) {
+        moved += piece.data;
+    } else if (piece.zeros) {
+        const bool adjoins = gathered.offset + gathered.length == piece.offset;
+        if (gathered.length > 0 && (!adjoins || gathered.length + piece.length > unmap_max))
+            return unmapGathered();
+        if (gathered.length == 0)
+            gathered.offset = piece.offset;
+        gathered.length += piece.length;
+        gathered.data += piece.data;
+    } else if (int err = write(piece)) {
+        return err;
+    }
+    planned_data -= piece.data;
+    planned.pop_front();
+    return 0;
+}
+
+int Sender::write(const Piece &piece)
+{
+    Request *const request = takeRequest(piece);
+    return began(request,
+                 iscsi_write16_task(session.get(), sending.to.lun, piece.offset / block_size, request->buffer,
+                                    static_cast<uint32_t>(piece.length), block_size, 0, 0, 0, 0, 0, ended, request));
+}
+
+int Sender::unmapGathered()
+{
+    unmap_list blocks = {};
+    blocks.lba = gathered.offset / block_size;
+    blocks.num = static_cast<uint32_t>(gathered.length / block_size);
+    Request *const request = takeRequest(gathered);
+    gathered = Piece();
+    return began(request, iscsi_unmap_task(session.get(), sending.to.lun, 0, 0, &blocks, 1, ended, request));
+}
+
+Sender::Request *Sender::takeRequest(const Piece &piece)
+{
+    Request *const request = idle.back();
+    idle.pop_back();
+    request->piece = piece;
+    return request;
+}
+
+int Sender::began(Request *request, const scsi_task *task)
+{
+    if (task)
+        return 0;
+    idle.push_back(request);
+    return fail(-ENOMEM, "cannot begin an iSCSI command: %s", iscsi_get_error(session.get()));
+}
+
+int Sender::flush()
+{
+    answer_came = false;
+    if (!iscsi_synchronizecache16_task(session.get(), sending.to.lun, 0, 0, 0, 0, answered, this))
+        return fail(-ENOMEM, "cannot begin an iSCSI command: %s", iscsi_get_error(session.get()));
+    if (int err = awaitAnswer(flush_limit))
+        return err;
+    return answer_status == SCSI_STATUS_GOOD ? 0
+                                             : fail(-EIO, "%s could not flush what it got: %s",
+                                                    sending.to.target.c_str(), iscsi_get_error(session.get()));
+}
+
+/// What was sent is safe: nothing that goes wrong here matters.
+void Sender::logOut()
+{
+    answer_came = false;
+    if (iscsi_logout_async(session.get(), connected, this) == 0)
+        while (!answer_came && serve(false, logout_limit) == 0)
+            ;
+}
+
+int Sender::awaitAnswer(Clock::duration limit)
+{
+    last_movement = Clock::now();
+    while (!answer_came)
+        if (int err = serve(false, limit))
+            return err;
+    return 0;
+}
+
+int Sender::serve(bool busy, Clock::duration limit)
+{
+    iscsi_context *const iscsi = session.get();
+    pollfd connection = {iscsi_get_fd(iscsi), static_cast<short>(iscsi_which_events(iscsi)), 0};
+    poll(&connection, 1, busy ? 0 : static_cast<int>(progress_interval / 1ms));
+    if (iscsi_service(iscsi, connection.revents) != 0)
+        return failure ? failure
+                       : fail(-ECONNRESET, "the connection to %s broke: %s", sending.to.portal.c_str(),
+                              iscsi_get_error(iscsi));
+    if (failure)
+        return failure;
+    const auto now = Clock::now();
+    if (now - last_movement > limit)
+        return fail(-ETIMEDOUT, "%s does not answer", sending.to.portal.c_str());
+    if (!sending.progress || now - last_told < progress_interval)
+        return 0;
+    last_told = now;
+    return sending.progress(moved);
+}
+
+void Sender::connected(iscsi_context *, int status, void *, void *sender)
+{
+    Sender &self = *static_cast<Sender *>(sender);
+    self.answer_came = true;
+    self.answer_status = status;
+}
+
+void Sender::answered(iscsi_context *, int status, void *data, void *sender)
+{
+    Sender &self = *static_cast<Sender *>(sender);
+    const std::unique_ptr<scsi_task, FreeTask> task(static_cast<scsi_task *>(data));
+    self.answer_came = true;
+    self.answer_status = status;
+    if (status != SCSI_STATUS_GOOD || !task || task->cdb[0] != SCSI_OPCODE_SERVICE_ACTION_IN)
+        return;
+    const auto *size = static_cast<const scsi_readcapacity16 *>(scsi_datain_unmarshall(task.get()));
+    if (size && size->block_length == block_size)
+        self.capacity = (size->returned_lba + 1) * block_size;
+}
+
+void Sender::ended(iscsi_context *iscsi, int status, void *data, void *request)
+{
+    Request &mine = *static_cast<Request *>(request);
+    Sender &self = *mine.sender;
+    const std::unique_ptr<scsi_task, FreeTask> task(static_cast<scsi_task *>(data));
+    self.idle.push_back(&mine);
+    self.last_movement = Clock::now();
+    if (status == SCSI_STATUS_GOOD)
+        self.moved += mine.piece.data;
+    else if (!self.ending && !self.failure)
+        self.failure =
+            fail(-meaning(status, task.get()), "%s failed a write at %llu: %s", self.sending.to.target.c_str(),
+                 static_cast<unsigned long long>(mine.piece.offset), iscsi_get_error(iscsi));
+}
+
+} // namespace
+
+int sendRanges(const Sending &sending)
+{
+    const PipeSignalBlock no_signal;
+    return Sender(sending).run();
+}
+
+} // namespace norvhost
