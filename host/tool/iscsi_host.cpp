@@ -1,4 +1,5 @@
 /// iscsi-host: the administrator's tool of the host platform.
+#include "WebVerbs.h"
 #include "iscsihost/host.h"
 
 #include <CLI/CLI.hpp>
@@ -265,6 +266,8 @@ int runTool(int argc, char **argv)
     schedule->add_subcommand("run-due", "Run what is due; the system's timer calls this each minute")->callback([&] {
         status = runDue();
     });
+
+    addWebVerbs(app, status);
 
     try {
         app.parse(argc, argv);

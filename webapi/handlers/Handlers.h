@@ -17,6 +17,11 @@ constexpr char DEFAULT_MASKING[] = "default";
 Result failed(int code);
 Result failed(int code, const std::string &reason);
 
+Result openSession(const Request &request);
+Result showSession(const Request &request);
+Result closeSession(const Request &request);
+Result showHealth(const Request &request);
+
 Result listLuns(const Request &request);
 Result createLun(const Request &request);
 Result showLun(const Request &request);

@@ -32,17 +32,6 @@ size_t sequenceLength(std::string_view text)
     return bad ? 0 : length;
 }
 
-bool isUtf8(std::string_view text)
-{
-    while (!text.empty()) {
-        const size_t length = sequenceLength(text);
-        if (length == 0)
-            return false;
-        text.remove_prefix(length);
-    }
-    return true;
-}
-
 bool isChoice(std::string_view choices, std::string_view word)
 {
     while (true) {
@@ -164,6 +153,17 @@ private:
 int checkInput(Fields fields, const Json::Value &input, std::string &reason)
 {
     return Checker(reason).checkObject(fields, input, "");
+}
+
+bool isUtf8(std::string_view text)
+{
+    while (!text.empty()) {
+        const size_t length = sequenceLength(text);
+        if (length == 0)
+            return false;
+        text.remove_prefix(length);
+    }
+    return true;
 }
 
 bool isUuid(const std::string &text)

@@ -6,6 +6,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <string>
+#include <string_view>
 
 namespace webapi {
 
@@ -53,6 +54,8 @@ inline const Field *Fields::end() const
 /// Checks an object against its fields. Returns 0, or an error code with `reason` naming the field
 /// that is wrong; values are not repeated there, they can be secrets.
 int checkInput(Fields fields, const Json::Value &input, std::string &reason);
+
+bool isUtf8(std::string_view text);
 
 /// Whether the text is of the form 8-4-4-4-12 hexadecimal digits.
 bool isUuid(const std::string &text);

@@ -4,7 +4,6 @@
 
 #include <cctype>
 #include <new>
-#include <optional>
 
 namespace webapi {
 namespace {
@@ -15,25 +14,6 @@ int hexDigit(char c)
         return c - '0';
     const int lower = std::tolower(static_cast<unsigned char>(c));
     return lower >= 'a' && lower <= 'f' ? lower - 'a' + 10 : -1;
-}
-
-/// Undoes the percent-encoding; nothing for a broken one or an encoded NUL.
-std::optional<std::string> decodeSegment(const std::string &segment)
-{
-    std::string text;
-    for (size_t i = 0; i < segment.size(); ++i) {
-        if (segment[i] != '%') {
-            text += segment[i];
-            continue;
-        }
-        const int high = i + 2 < segment.size() ? hexDigit(segment[i + 1]) : -1;
-        const int low = high >= 0 ? hexDigit(segment[i + 2]) : -1;
-        if (low < 0 || (high == 0 && low == 0))
-            return std::nullopt;
-        text += static_cast<char>(high * 16 + low);
-        i += 2;
-    }
-    return text;
 }
 
 std::vector<std::string> split(const std::string &path)
@@ -48,7 +28,7 @@ std::vector<std::string> split(const std::string &path)
     return segments;
 }
 
-/// Whether the path fits the pattern; fills the parameters.
+/// Whether the path fits the pattern; fills the parameters if so.
 bool match(const std::string &pattern, const std::vector<std::string> &path, std::map<std::string, std::string> &values)
 {
     const std::vector<std::string> wanted = split(pattern);
@@ -61,7 +41,7 @@ bool match(const std::string &pattern, const std::vector<std::string> &path, std
                 return false;
             continue;
         }
-        const auto value = decodeSegment(path[i]);
+        const auto value = decodePercent(path[i]);
         if (!value)
             return false;
         values[wanted[i].substr(1, wanted[i].size() - 2)] = *value;
@@ -71,28 +51,41 @@ bool match(const std::string &pattern, const std::vector<std::string> &path, std
 
 } // namespace
 
-Result dispatch(Method method, const std::string &path, const Json::Value &input, const std::string &account)
+Found findRoute(Method method, const std::string &path)
+{
+    const std::vector<std::string> segments = split(path);
+    Found found;
+    for (const Route &route : routes()) {
+        if (!match(route.path, segments, found.path))
+            continue;
+        if (route.method == method) {
+            found.route = &route;
+            break;
+        }
+        found.methods.push_back(route.method);
+    }
+    return found;
+}
+
+Result runRoute(const Route &route, const Request &request)
 {
     try {
-        const std::vector<std::string> segments = split(path);
-        Request request;
-        request.account = account;
-        for (const Route &route : routes()) {
-            if (route.method != method || !match(route.path, segments, request.path))
-                continue;
-            Result refused;
-            refused.code = checkInput(route.fields, input, refused.reason);
-            if (refused.code)
-                return refused;
-            request.input = input;
-            return route.handler(request);
-        }
-        return {ISCSI::ERR_NO_SUCH_API, path, {}};
+        Result refused;
+        refused.code = checkInput(route.fields, request.input, refused.reason);
+        return refused.code ? refused : route.handler(request);
     } catch (const std::bad_alloc &) {
         return {ISCSI::ERR_OUT_OF_MEMORY, "", {}};
     } catch (const std::exception &e) {
         return {ISCSI::ERR_DEFAULT_ERROR_CODE, e.what(), {}};
     }
+}
+
+Result dispatch(Method method, const std::string &path, const Json::Value &input, const std::string &account)
+{
+    const Found found = findRoute(method, path);
+    if (!found.route)
+        return {ISCSI::ERR_NO_SUCH_API, path, {}};
+    return runRoute(*found.route, {found.path, input, account});
 }
 
 std::string pathSegment(const std::string &text)
@@ -110,6 +103,24 @@ std::string pathSegment(const std::string &text)
         }
     }
     return segment;
+}
+
+std::optional<std::string> decodePercent(std::string_view encoded)
+{
+    std::string text;
+    for (size_t i = 0; i < encoded.size(); ++i) {
+        if (encoded[i] != '%') {
+            text += encoded[i];
+            continue;
+        }
+        const int high = i + 2 < encoded.size() ? hexDigit(encoded[i + 1]) : -1;
+        const int low = high >= 0 ? hexDigit(encoded[i + 2]) : -1;
+        if (low < 0 || (high == 0 && low == 0))
+            return std::nullopt;
+        text += static_cast<char>(high * 16 + low);
+        i += 2;
+    }
+    return text;
 }
 
 } // namespace webapi

@@ -37,6 +37,12 @@ constexpr uint64_t PIN_MAX_BYTES = 64;
 constexpr uint64_t TOKEN_MAX_BYTES = 255;
 constexpr uint64_t UUID_BYTES = 36;
 
+constexpr Field LOGIN[] = {
+    {"account", Type::Text, REQUIRED, 1, NAME_MAX_BYTES, ERR_INVALID_INPUT},
+    {"password", Type::Text, REQUIRED, 1, PASSWORD_MAX_BYTES, ERR_INVALID_INPUT},
+    {"otp_code", Type::Text, OPTIONAL, 0, OTP_MAX_BYTES, ERR_INVALID_INPUT},
+};
+
 constexpr Field LUN_LIST[] = {
     {"status", Type::Boolean, OPTIONAL, 0, 0, 0},
 };
@@ -215,6 +221,10 @@ constexpr Fields NONE;
 const std::vector<Route> &routes()
 {
     static const std::vector<Route> table = {
+        {Method::Get, "/health", Role::Anyone, NONE, showHealth},
+        {Method::Post, "/session", Role::Anyone, LOGIN, openSession},
+        {Method::Get, "/session", Role::Viewer, NONE, showSession},
+        {Method::Delete, "/session", Role::Viewer, NONE, closeSession},
         {Method::Get, "/luns", Role::Viewer, LUN_LIST, listLuns},
         {Method::Post, "/luns", Role::Admin, LUN_CREATE, createLun},
         {Method::Get, "/luns/{lun}", Role::Viewer, NONE, showLun},
