@@ -218,8 +218,8 @@ CREATE TABLE pins (
     PRIMARY KEY (host, port)
 ) STRICT, WITHOUT ROWID;
 
--- Halves of replications. The latest sending from here, what arrives here (which state, and below which place of its LUN
--- it is flushed), and the latest count of unsynchronised bytes.
+-- Halves of replications. The latest sending from here; what arrives here: which state on which base, what the LUN held
+-- before, and below which place it is flushed; the latest count of unsynchronised bytes.
 CREATE TABLE replication_tasks (
     id INTEGER PRIMARY KEY,
     uuid TEXT NOT NULL UNIQUE,
@@ -234,7 +234,10 @@ CREATE TABLE replication_tasks (
     total INTEGER NOT NULL DEFAULT 0,
     progress INTEGER NOT NULL DEFAULT 0,
     error INTEGER NOT NULL DEFAULT 0,
+    stop INTEGER NOT NULL DEFAULT 0,
     arriving TEXT NOT NULL DEFAULT '',
+    arriving_base TEXT NOT NULL DEFAULT '',
+    arriving_on TEXT NOT NULL DEFAULT '',
     arrived INTEGER NOT NULL DEFAULT 0,
     unsync_bytes INTEGER NOT NULL DEFAULT 0,
     unsync_completed INTEGER NOT NULL DEFAULT 0,
@@ -250,11 +253,13 @@ CREATE TABLE sinks (
     seen INTEGER NOT NULL
 ) STRICT;
 
--- LUNs on their way to a sink of a node. The sink's target is empty while none is open for us. An errno value is the
--- state of a transfer that ended otherwise than complete; bytes are those of the ended transfer.
+-- LUNs on their way to a sink of a node. `sink_iqn` is empty while no sink is open for us. `state` is the errno value of
+-- a transfer that ended otherwise than complete; the bytes are those of an ended transfer. A removed row tells what
+-- became of it until its LUN has another.
 CREATE TABLE virtual_luns (
-    uuid TEXT PRIMARY KEY,
-    lid INTEGER NOT NULL REFERENCES luns ON DELETE RESTRICT,
+    id INTEGER PRIMARY KEY AUTOINCREMENT,
+    uuid TEXT NOT NULL UNIQUE,
+    lid INTEGER NOT NULL REFERENCES luns ON DELETE CASCADE,
     kind INTEGER NOT NULL,
     node TEXT NOT NULL DEFAULT '',
     portal TEXT NOT NULL DEFAULT '',
@@ -263,8 +268,26 @@ CREATE TABLE virtual_luns (
     moved INTEGER NOT NULL DEFAULT 0,
     total INTEGER NOT NULL DEFAULT 0,
     ended INTEGER NOT NULL DEFAULT 0 CHECK (ended IN (0, 1)),
-    state INTEGER NOT NULL DEFAULT 0
-) STRICT, WITHOUT ROWID;
+    state INTEGER NOT NULL DEFAULT 0,
+    removed INTEGER NOT NULL DEFAULT 0 CHECK (removed IN (0, 1))
+) STRICT;
+
+-- Of each LUN, what the transfer had become whose virtual LUN was removed last.
+CREATE TABLE removed_transfers (
+    lid INTEGER PRIMARY KEY REFERENCES luns ON DELETE CASCADE,
+    uuid TEXT NOT NULL,
+    node TEXT NOT NULL,
+    portal TEXT NOT NULL,
+    sink TEXT NOT NULL,
+    moved INTEGER NOT NULL,
+    total INTEGER NOT NULL,
+    ended INTEGER NOT NULL,
+    state INTEGER NOT NULL
+) STRICT;
+CREATE TRIGGER keep_removed_transfer AFTER DELETE ON virtual_luns WHEN OLD.sink <> '' BEGIN
+    INSERT OR REPLACE INTO removed_transfers VALUES
+        (OLD.lid, OLD.uuid, OLD.node, OLD.portal, OLD.sink, OLD.moved, OLD.total, OLD.ended, OLD.state);
+END;
 )sql",
 };
 
