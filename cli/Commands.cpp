@@ -9,7 +9,8 @@ namespace {
 constexpr char FOOTER[] = "A LUN is selected by its name, its UUID or its place in the list (lun#1), a\n"
                           "target by its name, its ID or its place in the list (tg#1), a snapshot by the\n"
                           "names of its LUN and its own (vm1_nightly), its UUID or its place in the list\n"
-                          "(sn#1). Sizes are bytes, or take a binary unit: 512M, 1.5G, 10T.\n"
+                          "(sn#1), a node by its host name, its UUID or its place in the list (node#2).\n"
+                          "Sizes are bytes, or take a binary unit: 512M, 1.5G, 10T.\n"
                           "Exit status: 0 done, 1 failed, 2 wrong arguments.";
 
 /// Help without the lists of options that need or exclude each other; the parser tells when it matters.
@@ -37,11 +38,19 @@ std::unique_ptr<Commands> makeCommands()
     app.footer(FOOTER);
     app.formatter(std::make_shared<HelpFormatter>());
     app.require_subcommand(1);
+    app.add_option("--host", commands->host,
+                   "Work on the appliance there, https://HOST[:PORT], and not on this machine")
+        ->type_name("URL");
+    app.add_option("--fingerprint", commands->fingerprint, "Key of that appliance, unless it is known by a login")
+        ->type_name("FINGERPRINT");
     addLunVerbs(*commands);
     addSnapshotVerbs(*commands);
     addTransferVerbs(*commands);
     addUpkeepVerbs(*commands);
     addTargetVerbs(*commands);
+    addNodeVerbs(*commands);
+    addVlunVerbs(*commands);
+    addSessionVerbs(*commands);
 
     CLI::App &completion = addNoun(*commands, "completion", "Print a script that completes words for a shell");
     for (const char *shell : {"bash", "zsh"})
@@ -120,6 +129,13 @@ void addYes(CLI::App &verb, bool &yes)
 void addWatch(CLI::App &verb, bool &watch)
 {
     verb.add_flag("--watch", watch, "Show how far it is until it has ended; Ctrl-C ends the watching only");
+}
+
+void addPasswordFile(CLI::App &verb, std::string &file)
+{
+    verb.add_option("--password-file", file,
+                    "File whose first line is the password, - for standard input; without it, you are asked")
+        ->type_name("FILE");
 }
 
 std::vector<const CLI::Option *> shownOptions(const CLI::App &verb)

@@ -1,7 +1,7 @@
 /// The definitions of nouns, verbs and options: what is parsed, helped with, completed and documented.
 ///
 /// The type name of an option, and the name of a positional argument, says what can stand there: LUN,
-/// SNAPSHOT and TARGET are selectors, FILE and DIR paths, words between '|' the only ones allowed.
+/// SNAPSHOT, TARGET, NODE and VLUN are selectors, FILE and DIR paths, words between '|' the only ones allowed.
 #pragma once
 
 #include <CLI/CLI.hpp>
@@ -16,6 +16,8 @@ namespace cli {
 struct Commands {
     CLI::App app{"Manage the LUNs and targets of an iSCSI storage appliance.", "iscsictl"};
     std::function<void()> run; ///< what the parsed verb does; throws Failure and UsageError
+    std::string host;          ///< URL of the appliance to talk to; empty: this machine is it
+    std::string fingerprint;   ///< that appliance's key; empty: the one that is known
 };
 
 std::unique_ptr<Commands> makeCommands();
@@ -25,6 +27,9 @@ void addTargetVerbs(Commands &commands);
 void addSnapshotVerbs(Commands &commands);
 void addTransferVerbs(Commands &commands); ///< of the nouns "lun" and "snapshot", which exist
 void addUpkeepVerbs(Commands &commands);
+void addNodeVerbs(Commands &commands);
+void addVlunVerbs(Commands &commands); ///< some of the noun "lun", which exists
+void addSessionVerbs(Commands &commands);
 
 /// What most verbs take.
 struct Arguments {
@@ -56,6 +61,7 @@ void addFlag(CLI::App &verb, const char *flags, Json::Value &input, const char *
 void addJson(CLI::App &verb, bool &json);
 void addYes(CLI::App &verb, bool &yes);
 void addWatch(CLI::App &verb, bool &watch);
+void addPasswordFile(CLI::App &verb, std::string &file);
 
 /// The options and positional arguments of a verb that are shown to people.
 std::vector<const CLI::Option *> shownOptions(const CLI::App &verb);

@@ -50,10 +50,12 @@ else
 fi
 )";
 
-void addNames(Words &found, const char *path)
+void addKeys(Words &found, const char *path, const char *key)
 {
-    for (const Json::Value &object : request(webapi::Method::Get, path))
-        found.push_back(object["name"].asString());
+    for (const Json::Value &object : request(webapi::Method::Get, path)) {
+        if (!object[key].asString().empty())
+            found.push_back(object[key].asString());
+    }
 }
 
 /// A snapshot's name is that of its LUN up to the first underscore, and its own up to the first blank.
@@ -72,11 +74,15 @@ Words candidatesOf(const CLI::Option &option)
     const std::string kind = argumentKind(option);
     Words found;
     if (kind == "LUN")
-        addNames(found, "/luns");
+        addKeys(found, "/luns", "name");
     else if (kind == "TARGET")
-        addNames(found, "/targets");
+        addKeys(found, "/targets", "name");
     else if (kind == "SNAPSHOT")
         addSnapshotNames(found);
+    else if (kind == "NODE")
+        addKeys(found, "/nodes", "hostname");
+    else if (kind == "VLUN")
+        addKeys(found, "/vluns", "uuid");
     else if (kind == "FILE" || kind == "DIR")
         found.push_back(":" + kind);
     else if (kind == "DIRECTORY")
@@ -109,6 +115,21 @@ const CLI::Option *valueOption(const CLI::App &app, const std::string &word)
     return option && !option->get_positional() && option->get_items_expected_max() > 0 ? option : nullptr;
 }
 
+/// Puts together what bash takes apart at colons, up to the last word.
+Words rejoined(const Words &words)
+{
+    Words out;
+    for (size_t i = 0; i < words.size(); ++i) {
+        const bool last = i + 1 == words.size();
+        const bool goes_on = i > 0 && !last && (words[i] == ":" || words[i - 1] == ":");
+        if (goes_on && !out.empty())
+            out.back() += words[i];
+        else
+            out.push_back(words[i]);
+    }
+    return out;
+}
+
 Words candidates(const CLI::App &root, const Words &words)
 {
     const CLI::App *app = &root;
@@ -117,8 +138,12 @@ Words candidates(const CLI::App &root, const Words &words)
     bool only_positionals = false;
     for (size_t i = 0; i + 1 < words.size(); ++i) {
         const std::string &word = words[i];
-        if (open) {
-            open = word == "=" ? open : nullptr; // bash makes "--size=1G" three words
+        if (open && word != "=") { // bash makes "--size=1G" three words
+            if (open == root.get_option("--host"))
+                connect(word, "");
+            open = nullptr;
+        } else if (open) {
+            continue;
         } else if (word == "--" && !only_positionals) {
             only_positionals = true;
         } else if (word.size() > 1 && word[0] == '-' && !only_positionals) {
@@ -152,7 +177,7 @@ void complete(const Words &words)
 {
     const std::string last = words.empty() || words.back() == "=" ? "" : words.back();
     std::string text;
-    for (const std::string &found : candidates(makeCommands()->app, words)) {
+    for (const std::string &found : candidates(makeCommands()->app, rejoined(words))) {
         const bool one_line = found.find('\n') == std::string::npos;
         if (one_line && (found[0] == ':' || found.compare(0, last.size(), last) == 0))
             text += found + "\n";

@@ -1,5 +1,7 @@
 #include "cli/Request.h"
 
+#include "cli/Display.h"
+#include "cli/Remote.h"
 #include "iscsiwebapi/ISCSIErrorCode.h"
 
 #include <json/writer.h>
@@ -12,10 +14,33 @@
 #include <unistd.h>
 
 namespace cli {
+namespace {
+
+std::unique_ptr<Remote> appliance;
+
+} // namespace
+
+void connect(const std::string &url, const std::string &fingerprint)
+{
+    const auto address = parseUrl(url);
+    if (!address)
+        throw UsageError{"--host: '" + url + "' is not https://HOST or https://HOST:PORT"};
+    appliance = std::make_unique<Remote>(*address, fingerprint);
+}
+
+Remote *remote()
+{
+    return appliance.get();
+}
+
+webapi::Result perform(webapi::Method method, const std::string &path, const Json::Value &input)
+{
+    return appliance ? appliance->dispatch(method, path, input) : webapi::dispatch(method, path, input);
+}
 
 Json::Value request(webapi::Method method, const std::string &path, const Json::Value &input)
 {
-    webapi::Result result = webapi::dispatch(method, path, input);
+    webapi::Result result = perform(method, path, input);
     if (result.code)
         throw Failure{result.code, result.reason};
     return std::move(result.value);
@@ -72,6 +97,17 @@ bool confirmed(const std::string &question)
     fprintf(stderr, "%s [y/N] ", question.c_str());
     char answer[16];
     return fgets(answer, sizeof(answer), stdin) && (answer[0] == 'y' || answer[0] == 'Y');
+}
+
+void confirmKey(const std::string &appliance, const std::string &pin, bool yes)
+{
+    fprintf(stderr, "%s shows the key %s\n", shown(appliance).c_str(), shown(pin).c_str());
+    if (yes)
+        return;
+    if (!isatty(STDIN_FILENO))
+        throw UsageError{"--fingerprint or --yes is needed when there is no terminal to ask"};
+    if (!confirmed("Does 'iscsi-host certificate show' print the same there?"))
+        throw Failure{ISCSI::ERR_NO_PERMISSION, "its key is not trusted"};
 }
 
 } // namespace cli

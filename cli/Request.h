@@ -9,6 +9,8 @@
 
 namespace cli {
 
+class Remote;
+
 /// A request that failed: exit status 1.
 struct Failure {
     int code;
@@ -20,7 +22,17 @@ struct UsageError {
     std::string reason;
 };
 
-/// Runs a request in this process; throws Failure.
+/// Lets requests go to the appliance at a URL, "https://HOST[:PORT]", in place of this process's own. `fingerprint`,
+/// unless it is empty, is the key that it must show. Throws UsageError and Failure.
+void connect(const std::string &url, const std::string &fingerprint);
+
+/// The appliance that requests go to; null: they are run in this process.
+Remote *remote();
+
+/// Runs a request, wherever.
+webapi::Result perform(webapi::Method method, const std::string &path, const Json::Value &input);
+
+/// The same; throws Failure.
 Json::Value request(webapi::Method method, const std::string &path,
                     const Json::Value &input = Json::Value(Json::objectValue));
 
@@ -40,5 +52,8 @@ void printTransfer(const char *kind, const std::string &path);
 /// Throws UsageError unless there is a terminal to confirm something at.
 void requireTerminal();
 bool confirmed(const std::string &question);
+
+/// Shows the key of an appliance and asks whether it is the right one, unless `yes`; throws when it is not.
+void confirmKey(const std::string &appliance, const std::string &pin, bool yes);
 
 } // namespace cli

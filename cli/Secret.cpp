@@ -78,7 +78,7 @@ std::string ask(FILE *terminal, const std::string &prompt)
 
 } // namespace
 
-std::string readSecret(const std::string &file, const std::string &what)
+std::string readSecret(const std::string &file, const std::string &what, Asked asked)
 {
     if (file == "-")
         return readLine(stdin, "standard input");
@@ -92,7 +92,7 @@ std::string readSecret(const std::string &file, const std::string &what)
     if (!terminal)
         throw UsageError{"no terminal to ask for the " + what + ": give a file that holds it"};
     const std::string secret = ask(terminal.get(), what);
-    if (ask(terminal.get(), what + ", again") != secret)
+    if (asked == Asked::Twice && ask(terminal.get(), what + ", again") != secret)
         throw Failure{ISCSI::ERR_BAD_PARAMETER, "the two answers for the " + what + " differ"};
     return secret;
 }

@@ -54,8 +54,11 @@ Progress askTransfer(const Transfer &transfer, const std::function<bool()> &comp
     throw Failure{step, ""};
 }
 
+/// A path on the appliance: relative ones are those of this machine.
 std::string absolutePath(const std::string &path)
 {
+    if (remote() && std::filesystem::path(path).is_relative())
+        throw UsageError{"'" + path + "' is a directory of the appliance: give its whole path"};
     return std::filesystem::absolute(path).lexically_normal().string();
 }
 
@@ -80,13 +83,15 @@ void addExport(Commands &commands, CLI::App &noun)
         action.title = "Exporting " + a->selector + " to " + destination;
         action.later = "'iscsictl snapshot show' tells how far it is, 'iscsictl snapshot export-cancel' stops it";
         action.ask = [transfer = exportOf(a->selector), destination] {
-            // An export's record gets its name last.
+            // An export's record gets its name last. Of another machine nobody can tell it.
             return askTransfer(transfer, [&] {
                 std::error_code ignored;
-                return std::filesystem::exists(destination + "/export.record", ignored);
+                return remote() || std::filesystem::exists(destination + "/export.record", ignored);
             });
         };
-        run(*a, action, "Exported " + a->selector + " to " + destination);
+        run(*a, action,
+            remote() ? "The export of " + a->selector + " has ended"
+                     : "Exported " + a->selector + " to " + destination);
     });
     addPositional(verb, "SNAPSHOT", a->selector, SNAPSHOT_HELP);
     addPositional(verb, "DIRECTORY", *folder, "Directory for the export, made if missing");

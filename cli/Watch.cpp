@@ -159,7 +159,7 @@ private:
     const int nothing = open("/dev/null", O_RDWR | O_CLOEXEC);
     for (int fd : {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO})
         dup2(nothing, fd);
-    const webapi::Result result = webapi::dispatch(webapi::Method::Post, action.path, action.input);
+    const webapi::Result result = perform(webapi::Method::Post, action.path, action.input);
     Json::Value answer;
     answer["code"] = result.code;
     answer["reason"] = result.reason;

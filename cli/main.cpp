@@ -57,6 +57,10 @@ const char *hint(int code)
     case ISCSI::ERR_NO_SUCH_TARGET:
     case ISCSI::ERR_FAILED_TO_LOAD_TARGET:
         return "'iscsictl target list' shows the targets";
+    case ISCSI::ERR_NO_SUCH_NODE:
+        return "'iscsictl node list' shows the nodes, 'iscsictl node join' adds one";
+    case ISCSI::ERR_BAD_VLUN_UUID:
+        return "'iscsictl vlun list' shows the virtual LUNs";
     case ISCSI::ERR_LUN_IS_MAPPED:
         return "'iscsictl lun show' tells to which targets, 'iscsictl lun unmap' removes it from them";
     case ISCSI::ERR_BAD_LUN_LOCATION:
@@ -82,7 +86,7 @@ const char *hint(int code)
     case ISCSI::ERR_IMPORT_INTERRUPT:
         return "'iscsictl lun show' tells whether something is imported into it";
     default:
-        return geteuid() == 0 ? nullptr : "the appliance's state is usually root's alone";
+        return cli::remote() || geteuid() == 0 ? nullptr : "the appliance's state is usually root's alone";
     }
 }
 
@@ -104,6 +108,8 @@ int runCommandLine(int argc, char **argv)
     try {
         commands->app.parse(argc, argv);
         command = commandName(commands->app);
+        if (!commands->host.empty())
+            cli::connect(commands->host, commands->fingerprint);
         commands->run();
         return 0;
     } catch (const CLI::Success &asked_for_help) {

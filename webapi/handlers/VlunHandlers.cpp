@@ -21,13 +21,11 @@ namespace {
 
 const char *statusOf(const VirtualLun &vlun)
 {
-    if (vlun.state != 0)
-        return "failed";
-    if (vlun.total != 0 && vlun.moved == vlun.total)
-        return "complete";
     if (vlun.dst_lun_uuid.empty())
         return "unbound";
-    return vlun.exists ? "sending" : "stopped";
+    if (vlun.state != 0)
+        return "failed";
+    return vlun.running ? "sending" : vlun.ended ? "complete" : "stopped";
 }
 
 /// "first" and "second" are the transfer's two counters, bytes moved and bytes in all.
@@ -184,7 +182,7 @@ Result showRemoteClone(const Request &request)
         return err == ERR_BAD_VLUN_UUID ? failed(err, "it was never cloned to another node") : failed(err);
     Result result;
     result.value = describe(latest);
-    result.value["is_running"] = std::string("sending") == statusOf(latest);
+    result.value["is_running"] = latest.running;
     return result;
 }
 

@@ -15,17 +15,18 @@ struct VirtualLun {
     std::string node_uuid;    ///< where it is bound to; this and the next two are empty before
     std::string dst_lun_uuid; ///< of the sink LUN there
     std::string portal;
-    int state = 0;      ///< 0, or the errno value that ended the transfer
-    uint64_t moved = 0; ///< bytes
-    uint64_t total = 0; ///< bytes; 0 while it is not known yet
-    bool exists = true; ///< false for one that was removed
+    uint64_t moved = 0;   ///< bytes
+    uint64_t total = 0;   ///< bytes; 0 while it is not known yet
+    bool running = false; ///< its transfer goes on
+    bool ended = false;   ///< its transfer came to an end, by itself
+    int state = 0;        ///< 0, or the errno value that ended the transfer
 };
 
-/// Every virtual LUN, ascending by age.
+/// Every virtual LUN, ascending by UUID.
 ISCSI_HOST_API int listVirtualLuns(std::vector<VirtualLun> &vluns);
 
-/// The virtual LUN that was bound last to send this LUN; after its removal what it had become by then.
-/// 18991001 ("Bad vLUN UUID") when there never was one.
+/// The transfer of a LUN that runs or, when none does, the one whose virtual LUN was removed last, as it was then. One
+/// that is neither running nor ended was stopped by the removal. 18991001 ("Bad vLUN UUID") when there never was one.
 ISCSI_HOST_API int latestTransfer(const std::string &src_lun_uuid, VirtualLun &vlun);
 
 } // namespace iscsihost
