@@ -24,9 +24,9 @@ Json::Value listing(const std::vector<ISCSISnapshotInfo> &snapshots)
     Json::Value body(Json::objectValue);
     body["snapshots"] = Json::arrayValue;
     for (const ISCSISnapshotInfo &snapshot : snapshots) {
-        Json::Value one(Json::objectValue);
-        if (snapshot.toJsonFormat(one) == 0)
-            body["snapshots"].append(one);
+        Json::Value &one = body["snapshots"].append(Json::objectValue);
+        one["uuid"] = snapshot.uuid;
+        one["version"] = snapshot.version;
     }
     return body;
 }
@@ -43,7 +43,7 @@ WebAPIClientReplicationCreateTask::WebAPIClientReplicationCreateTask(
 
 WebAPIClientReplicationGet::WebAPIClientReplicationGet(const ISCSINodeInfo &node, const std::string &task_uuid,
                                                        bool additional)
-    : Client(node, "GET", "/replications/" + task_uuid + (additional ? "?additional=true" : ""))
+    : Client(node, "GET", "/replications/" + segment(task_uuid) + (additional ? "?additional=true" : ""))
 {
 }
 
@@ -54,7 +54,7 @@ bool WebAPIClientReplicationGet::readResponse(const Json::Value &response)
 
 WebAPIClientReplicationGetBaseVersion::WebAPIClientReplicationGetBaseVersion(
     const ISCSINodeInfo &node, const std::string &task_uuid, const std::vector<ISCSISnapshotInfo> &snapshots)
-    : Client(node, "POST", "/replications/" + task_uuid + "/base-version", listing(snapshots))
+    : Client(node, "POST", "/replications/" + segment(task_uuid) + "/base-version", listing(snapshots))
 {
 }
 

@@ -1,0 +1,41 @@
+/// The receiving side of a sending, as its peer asks for it.
+#pragma once
+
+#include <cstdint>
+#include <iscsihost/host.h>
+#include <string>
+
+namespace iscsihost {
+
+/// A state that a peer wants to send to the destination LUN of a task.
+struct Incoming {
+    std::string version; ///< UUID of the state
+    std::string base;    ///< version that the peer takes as what the LUN holds; empty for none
+};
+
+/// What the LUN holds instead of or besides the base.
+enum class Holding {
+    zeros,   ///< nothing but zeros
+    base,    ///< the base
+    unknown, ///< something: everything has to be sent, zeros too
+};
+
+struct Reception {
+    Holding holding = Holding::unknown;
+    uint64_t offset = 0; ///< what lies below it has arrived before
+};
+
+/// Makes the destination LUN ready: it holds the base, set back to the snapshot of it where needed, or the reception
+/// says what else. From now on its current version is `incoming.version` and differs from its base.
+/// NORV_ERR_NOT_A_DESTINATION_TASK, NORV_ERR_LUN_LOCKED.
+ISCSI_HOST_API int beginReception(const std::string &task_uuid, const Incoming &incoming, Reception &reception);
+
+/// What lies below `offset` has arrived and is flushed; `moved` bytes of `total`. NORV_ERR_BASE_SNAPSHOT when another
+/// state is arriving.
+ISCSI_HOST_API int noteReception(const std::string &task_uuid, const std::string &version, uint64_t offset,
+                                 uint64_t moved, uint64_t total);
+
+/// All has arrived and is flushed: the version is the LUN's base now. Codes as above.
+ISCSI_HOST_API int endReception(const std::string &task_uuid, const std::string &version);
+
+} // namespace iscsihost

@@ -1,0 +1,158 @@
+/// What arrives at a destination.
+///
+/// The version in the file's attributes and the place in the task's row belong together: a place counts only while its
+/// state is the one that arrives. Both change in this order: data flushed, place stored.
+#include "host/core/LastError.h"
+#include "host/replication/Roles.h"
+#include "host/replication/TaskStore.h"
+#include "host/storage/LunStore.h"
+#include "host/storage/MapFile.h"
+#include "host/storage/Versions.h"
+#include "iscsihost/replication.h"
+#include "platform/error.h"
+
+#include <algorithm>
+#include <iterator>
+#include <string>
+#include <utility>
+
+using namespace norvhost;
+using iscsihost::Holding;
+using iscsihost::Incoming;
+using iscsihost::Reception;
+
+namespace {
+
+/// A task's destination LUN.
+struct Destination {
+    TaskRow task;
+    LunRow lun;
+    std::string path;
+    Versions versions;
+    Arrival arrival;
+
+    int load(const std::string &task_uuid);
+    int checkArriving(const std::string &version) const;
+};
+
+int Destination::load(const std::string &task_uuid)
+{
+    if (int err = loadTask(task_uuid, task))
+        return err;
+    if (task.record.is_source)
+        return fail(NORV_ERR_NOT_A_DESTINATION_TASK, "the task %s is a source here", task.record.uuid);
+    if (int err = loadLunByUuid(task.localLun(), lun))
+        return err;
+    path = dataPath(lun.record);
+    if (int err = readVersions(path, versions))
+        return err;
+    return loadArrival(task.record.uuid, arrival);
+}
+
+int Destination::checkArriving(const std::string &version) const
+{
+    if (versions.current != version || arrival.version != version)
+        return fail(NORV_ERR_BASE_SNAPSHOT, "the version %s is not the one that arrives at the LUN '%s'",
+                    version.c_str(), lun.record.name);
+    return 0;
+}
+
+constexpr std::pair<Holding, const char *> words[] = {
+    {Holding::zeros, "zeros"}, {Holding::base, "base"}, {Holding::unknown, "unknown"}};
+
+const char *wordOf(Holding holding)
+{
+    return std::find_if(std::begin(words), std::end(words), [&](auto &pair) { return pair.first == holding; })->second;
+}
+
+/// Whether the same sending was begun before and can go on.
+bool goOn(const Destination &destination, const Incoming &incoming, Reception &reception)
+{
+    const Arrival &arrival = destination.arrival;
+    if (arrival.version != incoming.version || arrival.base != incoming.base ||
+        destination.versions.current != incoming.version)
+        return false;
+    const auto found =
+        std::find_if(std::begin(words), std::end(words), [&](auto &pair) { return arrival.holding == pair.second; });
+    if (found == std::end(words))
+        return false;
+    reception.holding = found->first;
+    reception.offset = arrival.offset;
+    return true;
+}
+
+/// Finds out what the LUN holds, and makes that the base where it can.
+int prepare(const Destination &destination, const Incoming &incoming, Reception &reception)
+{
+    const Versions &versions = destination.versions;
+    const bool touched = versions.current != versions.base;
+    if (incoming.base.empty()) {
+        reception.holding = versions.base == NORV_ZERO_UUID && !touched ? Holding::zeros : Holding::unknown;
+        return 0;
+    }
+    reception.holding = Holding::base;
+    if (versions.base == incoming.base && !touched)
+        return 0;
+    const int err = setBackTo(destination.lun, incoming.base);
+    if (err != NORV_ERR_NO_SUCH_SNAPSHOT)
+        return err;
+    reception.holding = Holding::unknown;
+    return 0;
+}
+
+} // namespace
+
+int iscsihost::beginReception(const std::string &task_uuid, const Incoming &incoming, Reception &reception)
+{
+    Destination destination;
+    Reception begun;
+    if (int err = destination.load(task_uuid))
+        return err;
+    if (!goOn(destination, incoming, begun)) {
+        if (int err = prepare(destination, incoming, begun))
+            return err;
+    }
+    if (int err = updateArrival(destination.task.record.uuid,
+                                {incoming.version, incoming.base, wordOf(begun.holding), begun.offset}))
+        return err;
+    if (int err = writeTransferCount(destination.path, Transfer::sending, {0, 1}))
+        return err;
+    if (int err = beginSynchronisation(destination.path, incoming.version))
+        return err;
+    reception = begun;
+    return 0;
+}
+
+int iscsihost::noteReception(const std::string &task_uuid, const std::string &version, uint64_t offset, uint64_t moved,
+                             uint64_t total)
+{
+    Destination destination;
+    if (int err = destination.load(task_uuid))
+        return err;
+    if (int err = destination.checkArriving(version))
+        return err;
+    // One more than there is until the end: the failed sending of nothing must not look complete.
+    if (int err = writeTransferCount(destination.path, Transfer::sending, {moved, total + 1}))
+        return err;
+    destination.arrival.offset = offset;
+    return updateArrival(destination.task.record.uuid, destination.arrival);
+}
+
+int iscsihost::endReception(const std::string &task_uuid, const std::string &version)
+{
+    Destination destination;
+    if (int err = destination.load(task_uuid))
+        return err;
+    if (destination.versions.base == version && destination.versions.current == version)
+        return 0; // told twice
+    if (int err = destination.checkArriving(version))
+        return err;
+    TransferCount count;
+    if (int err = readTransferCount(destination.path, Transfer::sending, count))
+        return err;
+    if (int err = finishSynchronisation(destination.path))
+        return err;
+    if (int err = writeTransferCount(destination.path, Transfer::sending, {count.total, count.total}))
+        return err;
+    return updateArrival(destination.task.record.uuid, {});
+}

@@ -1,0 +1,17 @@
+/// Sending snapshots of a task to its peer.
+#pragma once
+
+#include "host/replication/TaskStore.h"
+
+namespace norvhost {
+
+/// Whether a sender of the task runs.
+bool isSending(const char *task_uuid);
+
+/// Ends a running sender and waits until it is gone.
+int stopSending(const TaskRow &task);
+
+/// The progress as it is now: a sender that was killed is a failure.
+int readProgress(const TaskRow &task, _tag_iscsi_task_progress_ &progress);
+
+} // namespace norvhost
