@@ -2,6 +2,7 @@
 #include "host/core/LastError.h"
 #include "host/core/Lock.h"
 #include "host/services/Events.h"
+#include "host/services/Identity.h"
 #include "host/services/Retention.h"
 #include "host/services/Schedules.h"
 #include "host/state/Database.h"
@@ -105,8 +106,17 @@ int sweep(SweepReport &report)
     return 0;
 }
 
+int init(std::string &node_uuid)
+{
+    if (int err = makeIdentity())
+        return err;
+    return localNodeId(node_uuid);
+}
+
 int boot(SweepReport &report)
 {
+    if (int err = makeIdentity())
+        return err;
     std::vector<VolumeRow> rows;
     if (int err = loadVolumes(rows))
         return err;

@@ -1,6 +1,7 @@
 /// iscsi-host: the administrator's tool of the host platform.
-#include "WebVerbs.h"
+#include "AccountVerbs.h"
 #include "iscsihost/host.h"
+#include "WebVerbs.h"
 
 #include <CLI/CLI.hpp>
 #include <cstdio>
@@ -124,6 +125,15 @@ void printReport(const iscsihost::SweepReport &report)
     fflush(stdout);
 }
 
+int init()
+{
+    std::string node_uuid;
+    if (int err = iscsihost::init(node_uuid))
+        return failed("init", err);
+    printf("node %s\n", node_uuid.c_str());
+    return exit_ok;
+}
+
 int boot()
 {
     iscsihost::SweepReport report;
@@ -243,6 +253,8 @@ int runTool(int argc, char **argv)
     remove->add_option("DIR", folder, "The volume")->required();
     remove->callback([&] { status = removeVolume(folder); });
 
+    app.add_subcommand("init", "Make the state and the identity by which other appliances know this one")
+        ->callback([&] { status = init(); });
     app.add_subcommand("boot", "Mount the volumes, clean up, start the iSCSI service (root)")->callback([&] {
         status = boot();
     });
@@ -268,6 +280,7 @@ int runTool(int argc, char **argv)
     });
 
     addWebVerbs(app, status);
+    addAccountVerbs(app, status);
 
     try {
         app.parse(argc, argv);

@@ -17,6 +17,9 @@ extern "C" ISCSI_HOST_API const char *iscsi_host_last_error(void);
 
 namespace iscsihost {
 
+/// Makes the state, and the UUID and the keys by which other appliances know this one; what is there stays.
+ISCSI_HOST_API int init(std::string &node_uuid);
+
 /// A folder that LUNs may live in.
 struct Volume {
     std::string path;
@@ -52,8 +55,8 @@ struct SweepReport {
 /// Puts right what killed processes left behind on the mounted volumes.
 ISCSI_HOST_API int sweep(SweepReport &report);
 
-/// Mounts the created volumes, sweeps, starts the iSCSI daemons that do not run and makes them show what the state
-/// says. What could not be done is in `report.failed`, and the first code of it is returned.
+/// As init(). Mounts the created volumes, sweeps, starts the iSCSI daemons that do not run and makes them show what
+/// the state says. What could not be done is in `report.failed`, and the first code of it is returned.
 ISCSI_HOST_API int boot(SweepReport &report);
 
 /// After boot(): restarts daemons that die, until SIGTERM or SIGINT.
