@@ -253,13 +253,12 @@ CREATE TABLE sinks (
     seen INTEGER NOT NULL
 ) STRICT;
 
--- LUNs on their way to a sink of a node. `sink_iqn` is empty while no sink is open for us. `state` is the errno value of
--- a transfer that ended otherwise than complete; the bytes are those of an ended transfer. A removed row tells what
--- became of it until its LUN has another.
+-- LUNs on their way to a sink of a node. The sink's target is empty while none is open for us; the state is the errno
+-- value of a transfer that ended otherwise than complete, and the bytes are those of an ended transfer.
 CREATE TABLE virtual_luns (
     id INTEGER PRIMARY KEY AUTOINCREMENT,
     uuid TEXT NOT NULL UNIQUE,
-    lid INTEGER NOT NULL REFERENCES luns ON DELETE CASCADE,
+    lid INTEGER NOT NULL REFERENCES luns ON DELETE RESTRICT,
     kind INTEGER NOT NULL,
     node TEXT NOT NULL DEFAULT '',
     portal TEXT NOT NULL DEFAULT '',
@@ -268,8 +267,7 @@ CREATE TABLE virtual_luns (
     moved INTEGER NOT NULL DEFAULT 0,
     total INTEGER NOT NULL DEFAULT 0,
     ended INTEGER NOT NULL DEFAULT 0 CHECK (ended IN (0, 1)),
-    state INTEGER NOT NULL DEFAULT 0,
-    removed INTEGER NOT NULL DEFAULT 0 CHECK (removed IN (0, 1))
+    state INTEGER NOT NULL DEFAULT 0
 ) STRICT;
 
 -- Of each LUN, what the transfer had become whose virtual LUN was removed last.

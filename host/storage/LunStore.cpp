@@ -77,7 +77,7 @@ int refuseMapped(int lid)
 
 int refuseSent(int lid)
 {
-    Query query("SELECT uuid FROM virtual_luns WHERE lid = ?1 AND NOT removed");
+    Query query("SELECT uuid FROM virtual_luns WHERE lid = ?1");
     if (query.bind(lid).next())
         return fail(NORV_ERR_LUN_LOCKED, "the virtual LUN %s sends the LUN to another node: remove that first",
                     std::string(query.text(0)).c_str());
