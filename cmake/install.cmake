@@ -27,7 +27,13 @@ if(TARGET norvhost)
     install_programs(${CMAKE_INSTALL_SBINDIR} iscsi-host iscsi-portald)
     install_programs(norv/sbin epck) # below the prefix /usr this is where the library looks for it
     install(FILES host/systemd/iscsi-host-schedule.service host/systemd/iscsi-host-schedule.timer
-        DESTINATION lib/systemd/system)
+        host/systemd/iscsi-webapi.service DESTINATION lib/systemd/system)
+    set(webapi_folder ${CMAKE_INSTALL_LIBEXECDIR}/iscsi-host/webapi)
+    install_programs(${webapi_folder}/cgi iscsi-webapi)
+    install(FILES webapi/lighttpd/iscsi-webapi.conf DESTINATION ${webapi_folder})
+    install(DIRECTORY webapi/lighttpd/errors DESTINATION ${webapi_folder})
+    # The library's node configuration file lives here; it holds tokens.
+    install(DIRECTORY DESTINATION norv/etc DIRECTORY_PERMISSIONS OWNER_READ OWNER_WRITE OWNER_EXECUTE)
 endif()
 
 target_include_directories(iscsiwebapi INTERFACE
