@@ -78,14 +78,20 @@ Result askIdentity(const std::string &host, uint16_t port, const std::string &pi
     return {};
 }
 
-/// Lists the nodes; `found` is the one among them with this UUID, or null.
-int findNode(std::vector<ISCSINodeInfo> &nodes, const std::string &uuid, const ISCSINodeInfo *&found)
+/// Every node, this appliance first.
+Result loadNodes(std::vector<ISCSINodeInfo> &nodes)
 {
-    if (int err = ISCSILIBNode::ListNode(nodes))
-        return err;
+    const int err = ISCSILIBNode::ListNode(nodes);
+    if (err == ERR_BAD_NODE_UUID)
+        return failed(err, "this appliance has no identity yet: 'iscsi-host init' makes one");
+    return err ? failed(err) : Result{};
+}
+
+/// The one with this UUID, or null.
+const ISCSINodeInfo *findNode(const std::vector<ISCSINodeInfo> &nodes, const std::string &uuid)
+{
     const auto node = std::find_if(nodes.begin(), nodes.end(), [&](const auto &one) { return one.uuid == uuid; });
-    found = node == nodes.end() ? nullptr : &*node;
-    return 0;
+    return node == nodes.end() ? nullptr : &*node;
 }
 
 Result describeByUuid(const std::string &uuid)
@@ -113,30 +119,30 @@ void endSessionAt(const PairedNode &node)
 
 /// Ends the sessions that this appliance opened for a node. They are known by the node's host name, so that one which
 /// another node shares keeps them.
-int closeSessionsOf(const ISCSINodeInfo &node)
+Result closeSessionsOf(const ISCSINodeInfo &node)
 {
     std::vector<ISCSINodeInfo> nodes;
-    if (int err = ISCSILIBNode::ListNode(nodes))
-        return err;
+    if (Result bad = loadNodes(nodes); bad.code)
+        return bad;
     const auto sharing = std::count_if(nodes.begin(), nodes.end(),
                                        [&](const ISCSINodeInfo &other) { return other.hostname == node.hostname; });
     std::vector<iscsihost::Session> sessions;
     if (int err = sharing > 1 ? 0 : iscsihost::listSessions(sessions))
-        return err;
+        return failed(err);
     for (const iscsihost::Session &session : sessions) {
         if (session.app != PEER_APP || session.address != node.hostname)
             continue;
         if (int err = iscsihost::closeSession(session.id))
-            return err;
+            return failed(err);
     }
-    return 0;
+    return {};
 }
 
 /// Forgets a node here, and ends the sessions of both directions.
 Result forget(const ISCSINodeInfo &node)
 {
-    if (int err = closeSessionsOf(node))
-        return failed(err);
+    if (Result bad = closeSessionsOf(node); bad.code)
+        return bad;
     if (int err = node.deleteFromNodeConfig())
         return failed(err);
     PairedNode paired;
@@ -152,10 +158,9 @@ Result joinFailed(const Result &failure, const std::string &uuid, const std::str
                   const std::string &pin_before)
 {
     std::vector<ISCSINodeInfo> nodes;
-    const ISCSINodeInfo *paired = nullptr;
-    if (findNode(nodes, uuid, paired))
+    if (loadNodes(nodes).code)
         return failure;
-    if (paired)
+    if (findNode(nodes, uuid))
         return failed(failure.code, failure.reason + (failure.reason.empty() ? "" : "; ") +
                                         "it is paired half: remove the node before another try");
     PairedNode kept;
@@ -171,14 +176,14 @@ Result joinFailed(const Result &failure, const std::string &uuid, const std::str
 
 Result selectNode(const std::string &selector, ISCSINodeInfo &node)
 {
+    std::vector<ISCSINodeInfo> nodes;
+    if (Result bad = loadNodes(nodes); bad.code)
+        return bad;
     std::string uuid;
     const int err = ISCSINodeInfo::GetNodeUUID(selector == "local" ? "node#1" : selector, uuid);
     if (err && err != ERR_BAD_NODE_UUID)
         return failed(err);
-    std::vector<ISCSINodeInfo> nodes;
-    const ISCSINodeInfo *found = nullptr;
-    if (int unlisted = err ? 0 : findNode(nodes, uuid, found))
-        return failed(unlisted);
+    const ISCSINodeInfo *found = err ? nullptr : findNode(nodes, uuid);
     if (!found)
         return failed(ERR_NO_SUCH_NODE, "no node has the UUID, host name or index '" + selector + "'");
     node = *found;
@@ -188,8 +193,8 @@ Result selectNode(const std::string &selector, ISCSINodeInfo &node)
 Result listNodes(const Request &)
 {
     std::vector<ISCSINodeInfo> nodes;
-    if (int err = ISCSILIBNode::ListNode(nodes))
-        return failed(err);
+    if (Result bad = loadNodes(nodes); bad.code)
+        return bad;
     Result result;
     result.value = Json::arrayValue;
     for (const ISCSINodeInfo &node : nodes) {
@@ -240,10 +245,9 @@ Result joinNode(const Request &request)
     if (Result bad = askIdentity(host, port, pin, uuid); bad.code)
         return bad;
     std::vector<ISCSINodeInfo> nodes;
-    const ISCSINodeInfo *paired = nullptr;
-    if (int err = findNode(nodes, uuid, paired))
-        return failed(err);
-    if (paired)
+    if (Result bad = loadNodes(nodes); bad.code)
+        return bad;
+    if (const ISCSINodeInfo *paired = findNode(nodes, uuid))
         return failed(ERR_NODE_UUID_EXISTS,
                       host + (paired->is_local_node ? " is this appliance itself" : " is paired already"));
     if (int err = iscsihost::getPin(host, port, pin_before))
@@ -261,8 +265,8 @@ Result openPeerSession(const Request &request)
 {
     const std::string host = request.input["hostname"].asString();
     std::vector<ISCSINodeInfo> nodes;
-    if (int err = ISCSILIBNode::ListNode(nodes))
-        return failed(err);
+    if (Result bad = loadNodes(nodes); bad.code)
+        return bad;
     const ISCSINodeInfo &local = nodes.front();
     std::string rod_key;
     if (int err = local.loadLocalRODKey(rod_key))
