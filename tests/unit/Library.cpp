@@ -11,6 +11,7 @@
 #include <set>
 #include <stdexcept>
 
+#include <syslog.h>
 #include <unistd.h>
 
 namespace unit {
@@ -38,9 +39,10 @@ std::string withoutAddresses(const std::string &text)
 std::string withoutPlace(const fake::LogLine &line)
 {
     const std::string tag = "[E] iSCSIWebAPI:";
-    EXPECT_EQ(line.priority, 3);
+    EXPECT_TRUE(line.priority == LOG_ERR || line.priority == LOG_INFO) << line.priority;
     EXPECT_EQ(line.text.find(SECRET), std::string::npos) << line.text;
     EXPECT_EQ(line.text.find(MUTUAL_SECRET), std::string::npos) << line.text;
+    EXPECT_EQ(line.text.find(fake::model().peer.password), std::string::npos) << line.text;
 
     std::string text = line.text;
     const bool is_tagged = text.compare(0, tag.size(), tag) == 0;
@@ -54,7 +56,7 @@ std::string withoutPlace(const fake::LogLine &line)
     const char behind_number = text[digits];
     text.erase(0, digits + 1);
     const std::string method = behind_number == ':' ? takeUntil(text, ' ') : "";
-    return (is_tagged ? "[E] " : "") + method + ": " + withoutAddresses(text);
+    return (is_tagged ? "[E] " : line.priority == LOG_INFO ? "[info] " : "") + method + ": " + withoutAddresses(text);
 }
 
 std::set<std::string> written;
@@ -193,6 +195,20 @@ fake::Target &addTarget(int tid, const std::string &name)
 void addMapping(int tid, int lid, int mapping_index)
 {
     fake::model().mappings.push_back({tid, lid, mapping_index, nullptr});
+}
+
+void addNodes()
+{
+    NorvDRNode::DRNode local, peer;
+    local.id = LOCAL_NODE;
+    local.host = "local.example";
+    peer.id = PEER_NODE;
+    peer.host = "peer.example";
+    peer.port = 5443;
+    peer.protocol = "https";
+    peer.cred_session = "peer-session";
+    fake::model().nodes = {peer, local};
+    fake::model().node_attributes = {{PEER_NODE, "NORV.iSCSI", "rod_key", "kept-rod-key"}};
 }
 
 Json::Value parsed(const std::string &json)

@@ -33,7 +33,8 @@ protected:
 };
 
 /// Log lines since the last call, once detached workers have ended: "method: text" for "file:line:method text", ":
-/// text" for a head without method, "[E] method: text" for the tagged form; addresses stand as {addresses}.
+/// text" for a head without method, "[E] method: text" for the tagged form, "[info] method: text" for a line that is no
+/// failure; addresses stand as {addresses}.
 Lines logged();
 
 /// Platform calls since the last call, once detached workers have ended, as "Name(arguments)".
@@ -60,6 +61,11 @@ int privateLUNID();
 /// An enabled target in the fake's model, with CHAP in both directions.
 fake::Target &addTarget(int tid, const std::string &name);
 void addMapping(int tid, int lid, int mapping_index = 1);
+
+/// This appliance and a paired one in the fake's database, the latter with a ROD key and a session.
+const char *const LOCAL_NODE = "11111111-0000-4000-8000-000000000001";
+const char *const PEER_NODE = "11111111-0000-4000-8000-000000000002";
+void addNodes();
 
 /// A field of an SDK record, by its place.
 template <class Value>

@@ -24,7 +24,7 @@ struct Failure {
     std::string call; ///< the function, or "function#2" for its second call alone
     int code;         ///< INJECTED: the failing call's own
     Lines lines;
-    bool goes_on = false;     ///< to further platform calls
+    bool goes_on = false;     ///< to further platform calls, other than unlocking
     bool has_outputs = false; ///< those of success
     std::string outputs = {}; ///< when other than the operation's `untouched`
 
@@ -41,6 +41,13 @@ template <class... Texts>
 Failure stops(const std::string &call, int code, const Texts &...lines)
 {
     return {call, code, {lines...}};
+}
+
+/// The operation fails, and makes further calls to clean up.
+template <class... Texts>
+Failure cleansUp(const std::string &call, int code, const Texts &...lines)
+{
+    return {call, code, {lines...}, true};
 }
 
 /// The operation goes on, and succeeds.
@@ -70,6 +77,7 @@ struct Operation {
     std::function<Outcome()> run;
     std::string untouched; ///< outputs after a failure
     std::vector<Failure> failures;
+    Lines clean_lines = {}; ///< logged without a failure; a failure's lines hold those before it too
 };
 
 template <class... Failures>
@@ -77,6 +85,12 @@ Operation operation(const char *name, void (*set_up)(), std::function<Outcome()>
                     const Failures &...failures)
 {
     return {name, set_up, run, untouched, {failures...}};
+}
+
+inline Operation logging(const Lines &lines, Operation operation)
+{
+    operation.clean_lines = lines;
+    return operation;
 }
 
 class FailureSweep : public LibraryTest, public testing::WithParamInterface<Operation> {};
