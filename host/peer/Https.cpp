@@ -22,14 +22,14 @@ constexpr size_t headers_max = 64 << 10;
 /// A connection to one server, for one request.
 class Exchange {
 public:
-    Exchange(const std::string &host, uint16_t port) : server(authority(host, port)), host(host), port(port) {}
+    Exchange(const std::string &host, uint16_t port) : server(authority(host, port)), host(host) {}
     ~Exchange();
     Exchange(const Exchange &) = delete;
     Exchange &operator=(const Exchange &) = delete;
 
     int begin(const std::string &protocol, const std::string &path, int connect_seconds);
-    /// The server's key must be this one.
-    void requirePin(const std::string &pin);
+    /// The server's key must be this one. `advice` tells how another one is trusted; it may be empty.
+    void requirePin(const std::string &pin, const std::string &advice);
     /// Any key and certificate will do.
     void acceptAnyKey();
 
@@ -52,12 +52,11 @@ private:
 
     const std::string server;
     const std::string host;
-    const uint16_t port;
     const LibCurl *curl = nullptr;
     CURL *handle = nullptr;
     curl_slist *headers = nullptr;
     bool set_all = true;
-    std::string expected_pin;
+    std::string expected_pin, pin_advice;
     char message[CURL_ERROR_SIZE] = "";
 
     size_t header_bytes = 0;
@@ -95,10 +94,11 @@ int Exchange::begin(const std::string &protocol, const std::string &path, int co
     return 0;
 }
 
-void Exchange::requirePin(const std::string &pin)
+void Exchange::requirePin(const std::string &pin, const std::string &advice)
 {
     acceptAnyKey();
     expected_pin = pin;
+    pin_advice = advice;
     set(CURLOPT_PINNEDPUBLICKEY, pin.c_str());
 }
 
@@ -175,11 +175,11 @@ int Exchange::failed(CURLcode result)
     case CURLE_SSL_PINNEDPUBKEYNOTMATCH:
         if (int err = seenPin(seen))
             return err;
-        return fail(NORV_ERR_SEND_REQUEST, "the key of %s has changed: expected %s, it shows %s; if that is right: %s",
-                    server.c_str(), expected_pin.c_str(), seen.c_str(), trustCommand(host, port).c_str());
+        return fail(NORV_ERR_SEND_REQUEST, "the key of %s has changed: expected %s, it shows %s%s", server.c_str(),
+                    expected_pin.c_str(), seen.c_str(), pin_advice.c_str());
     case CURLE_PEER_FAILED_VERIFICATION:
         return fail(NORV_ERR_SEND_REQUEST, "%s is not trusted: %s; to trust its key: %s", server.c_str(), why,
-                    trustCommand(host, port).c_str());
+                    trustCommand(host).c_str());
     case CURLE_OPERATION_TIMEDOUT:
         return fail(NORV_ERR_SEND_REQUEST, "no answer from %s: %s", server.c_str(), why);
     case CURLE_OUT_OF_MEMORY:
@@ -289,14 +289,17 @@ int https(const HttpsRequest &request, HttpsAnswer &answer)
     if (int err = check(request))
         return err;
     std::string pin = request.pin;
-    if (pin.empty() && request.protocol == "https")
+    std::string advice;
+    if (pin.empty() && request.protocol == "https") {
         if (int err = getPin(request.host, request.port, pin))
             return err;
+        advice = "; if that is right: " + trustCommand(request.host);
+    }
     Exchange exchange(request.host, request.port);
     if (int err = exchange.begin(request.protocol, request.path, request.connect_seconds))
         return err;
     if (!pin.empty())
-        exchange.requirePin(pin);
+        exchange.requirePin(pin, advice);
     return exchange.request(request, answer);
 }
 

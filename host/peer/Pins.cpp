@@ -66,13 +66,13 @@ int learnPin(const std::string &host, uint16_t port, const std::string &pin)
         return 0;
     if (!known.empty())
         return fail(NORV_ERR_NO_PERMISSION, "%s has the key %s here, not %s; if it was changed: %s",
-                    authority(host, port).c_str(), known.c_str(), pin.c_str(), trustCommand(host, port).c_str());
+                    authority(host, port).c_str(), known.c_str(), pin.c_str(), trustCommand(host).c_str());
     return iscsihost::setPin(host, port, pin);
 }
 
-std::string trustCommand(const std::string &host, uint16_t port)
+std::string trustCommand(const std::string &host)
 {
-    return "iscsictl node trust " + (port == web_port ? host : authority(host, port));
+    return "iscsictl node trust " + host;
 }
 
 } // namespace norvhost

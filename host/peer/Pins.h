@@ -18,7 +18,7 @@ int pinOfCertificate(const std::string &pem, const std::string &origin, std::str
 /// NORV_ERR_NO_PERMISSION then, because only this appliance's administrator may trust a changed key.
 int learnPin(const std::string &host, uint16_t port, const std::string &pin);
 
-/// The command by which the administrator trusts the key that a server shows.
-std::string trustCommand(const std::string &host, uint16_t port);
+/// The command by which the administrator trusts the key that a node's server shows.
+std::string trustCommand(const std::string &host);
 
 } // namespace norvhost

@@ -60,13 +60,13 @@ bool WebAPIClientLUNCreate::readResponse(const Json::Value &response)
 }
 
 WebAPIClientLUNDelete::WebAPIClientLUNDelete(const ISCSINodeInfo &node, const std::string &lun_uuid)
-    : Client(node, "DELETE", "/luns/" + lun_uuid)
+    : Client(node, "DELETE", "/luns/" + segment(lun_uuid))
 {
 }
 
 WebAPIClientLUNSet::WebAPIClientLUNSet(const ISCSINodeInfo &node, const std::string &lun_uuid, const std::string &name,
                                        unsigned long long size)
-    : Client(node, "PATCH", "/luns/" + lun_uuid, changes(name, size))
+    : Client(node, "PATCH", "/luns/" + segment(lun_uuid), changes(name, size))
 {
 }
 
@@ -90,13 +90,13 @@ bool StateClient::readResponse(const Json::Value &response)
 
 WebAPIClientLUNGet::WebAPIClientLUNGet(const ISCSINodeInfo &node, const std::string &lun_uuid,
                                        const std::vector<std::string> &additional)
-    : StateClient(node, "/luns/" + lun_uuid, additional)
+    : StateClient(node, "/luns/" + segment(lun_uuid), additional)
 {
 }
 
 WebAPIClientLUNGetSnapshot::WebAPIClientLUNGetSnapshot(const ISCSINodeInfo &node, const std::string &snapshot_uuid,
                                                        const std::vector<std::string> &additional)
-    : StateClient(node, "/snapshots/" + snapshot_uuid, additional)
+    : StateClient(node, "/snapshots/" + segment(snapshot_uuid), additional)
 {
 }
 
@@ -105,7 +105,7 @@ WebAPIClientLUNTakeSnapshot::WebAPIClientLUNTakeSnapshot(const ISCSINodeInfo &no
                                                          const std::string &name, const std::string &description,
                                                          const std::string &taken_by, long snapshot_time,
                                                          bool is_scheduled)
-    : Client(node, "POST", "/luns/" + lun_uuid + "/snapshots",
+    : Client(node, "POST", "/luns/" + segment(lun_uuid) + "/snapshots",
              taking(is_app_consistent, is_user_locked, name, description, taken_by, snapshot_time, is_scheduled))
 {
 }

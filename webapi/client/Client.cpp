@@ -1,19 +1,10 @@
 #include "webapi/client/Client.h"
 
-#include "etc/JsonReader.h"
-#include "iscsiwebapi/ISCSIErrorCode.h"
-#include "platform/dr_node.h"
-
-#include <cstdint>
 #include <iscsihost/https.h>
-#include <json/reader.h>
 #include <json/writer.h>
-#include <memory>
 
 namespace ISCSI::WebAPI {
 namespace {
-
-constexpr int ANSWER_MAX_DEPTH = 16;
 
 std::string compact(const Json::Value &value)
 {
@@ -22,26 +13,16 @@ std::string compact(const Json::Value &value)
     return Json::writeString(builder, value);
 }
 
-bool parse(const std::string &text, Json::Value &value)
+iscsihost::HttpsRequest requestTo(const ISCSINodeInfo &node, const char *verb, const std::string &resource)
 {
-    Json::CharReaderBuilder builder;
-    Json::CharReaderBuilder::strictMode(&builder.settings_);
-    builder["stackLimit"] = ANSWER_MAX_DEPTH; // jsoncpp throws above it
-    const std::unique_ptr<Json::CharReader> reader(builder.newCharReader());
-    try {
-        return reader->parse(text.data(), text.data() + text.size(), &value, nullptr);
-    } catch (const Json::Exception &) {
-        return false;
-    }
-}
-
-/// A problem description carries the peer's own code.
-int peersCode(const Json::Value &problem)
-{
-    int code = 0;
-    if (!JsonReader(problem).required("code", code).ok() || code == 0)
-        return ERR_FAILED_TO_GET_ERROR_CODE;
-    return code;
+    iscsihost::HttpsRequest request;
+    request.host = node.hostname;
+    request.port = node.port;
+    request.protocol = node.protocol;
+    request.method = verb;
+    request.path = "/api/v1" + resource;
+    request.token = node.session_id;
+    return request;
 }
 
 } // namespace
@@ -58,7 +39,7 @@ int Client::send()
     Json::Value answer;
     if (int err = exchange(method, path, body, answer))
         return err;
-    return readResponse(answer) ? 0 : ERR_BAD_RESPONSE;
+    return readResponse(answer) ? 0 : iscsihost::incompleteAnswer(requestTo(node, method, path));
 }
 
 bool Client::readResponse(const Json::Value &)
@@ -66,31 +47,27 @@ bool Client::readResponse(const Json::Value &)
     return true;
 }
 
-int Client::exchange(const char *verb, const std::string &resource, const Json::Value &input, Json::Value &output)
+int Client::exchange(const char *verb, const std::string &resource, const Json::Value &input, Json::Value &output) const
 {
-    if (node.hostname.empty() || node.port == 0)
-        return ERR_FAILED_TO_CREATE_REQUEST;
-    iscsihost::HttpsRequest request;
-    request.host = node.hostname;
-    request.port = node.port;
-    request.protocol = node.protocol;
-    request.method = verb;
-    request.path = "/api/v1" + resource;
-    request.token = node.session_id;
+    iscsihost::HttpsRequest request = requestTo(node, verb, resource);
     if (!input.isNull())
         request.body = compact(input);
-    iscsihost::HttpsAnswer answer;
-    if (int err = iscsihost::https(request, answer))
-        return err;
-    if (answer.status == 204)
-        return 0;
-    Json::Value value;
-    if (answer.content_type.rfind("application/", 0) != 0 || !parse(answer.body, value))
-        return ERR_BAD_RESPONSE;
-    if (answer.status < 200 || answer.status > 299)
-        return peersCode(value);
-    output = value;
-    return 0;
+    return iscsihost::callApi(request, output);
+}
+
+std::string Client::segment(const std::string &identifier)
+{
+    std::string escaped;
+    for (const char c : identifier) {
+        if ((c >= '0' && c <= '9') || (c >= 'A' && c <= 'Z') || (c >= 'a' && c <= 'z') || c == '-') {
+            escaped += c;
+            continue;
+        }
+        constexpr char DIGITS[] = "0123456789ABCDEF";
+        const auto byte = static_cast<unsigned char>(c);
+        escaped += {'%', DIGITS[byte >> 4], DIGITS[byte & 15]};
+    }
+    return escaped;
 }
 
 } // namespace ISCSI::WebAPI

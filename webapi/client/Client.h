@@ -26,7 +26,10 @@ protected:
     virtual bool readResponse(const Json::Value &response);
 
     /// One request and its answer; `resource` is the path below the API's root. A failure as send() returns it.
-    int exchange(const char *verb, const std::string &resource, const Json::Value &input, Json::Value &output);
+    int exchange(const char *verb, const std::string &resource, const Json::Value &input, Json::Value &output) const;
+
+    /// One segment of a path. What an identifier holds cannot lead to another resource.
+    static std::string segment(const std::string &identifier);
 
     ISCSINodeInfo node; ///< session_id authenticates the request
 
