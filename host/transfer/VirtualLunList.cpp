@@ -65,7 +65,7 @@ int listVirtualLuns(std::vector<VirtualLun> &vluns)
 {
     std::vector<VirtualLun> found;
     {
-        Query query("SELECT " VLUN_COLUMNS " FROM virtual_luns JOIN luns USING (lid) ORDER BY virtual_luns.uuid");
+        Query query("SELECT " VLUN_COLUMNS " FROM virtual_luns JOIN luns USING (lid) ORDER BY virtual_luns.id");
         while (query.next())
             found.push_back(readRow(query));
         if (query.error())
@@ -82,7 +82,7 @@ int latestTransfer(const std::string &src_lun_uuid, VirtualLun &vlun)
     VirtualLun found;
     {
         Query query("SELECT " VLUN_COLUMNS " FROM virtual_luns JOIN luns USING (lid) "
-                    "WHERE luns.uuid = ?1 AND sink <> '' ORDER BY ended LIMIT 1");
+                    "WHERE luns.uuid = ?1 AND sink <> '' ORDER BY ended, virtual_luns.id DESC LIMIT 1");
         const int err = find(query, src_lun_uuid, found);
         if (err && err != BAD_VLUN_UUID)
             return err;

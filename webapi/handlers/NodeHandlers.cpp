@@ -6,7 +6,6 @@
 #include "iscsihost/session.h"
 #include "iscsiwebapi/ISCSIErrorCode.h"
 #include "iscsiwebapi/ISCSILIBNode.h"
-#include "webapi/handlers/JsonText.h"
 
 #include <algorithm>
 
@@ -66,14 +65,11 @@ Result askIdentity(const std::string &host, uint16_t port, const std::string &pi
     request.protocol = PROTOCOL;
     request.path = "/api/v1/health";
     request.pin = pin;
-    iscsihost::HttpsAnswer answer;
-    if (int err = iscsihost::https(request, answer))
-        return failed(err);
     Json::Value health;
-    const bool good = answer.status == 200 && parseJson(answer.body, health) && health.isObject() &&
-                      health["uuid"].isString() && isUuid(health["uuid"].asString());
-    if (!good)
-        return failed(ERR_BAD_RESPONSE, host + " does not answer as an appliance does");
+    if (int err = iscsihost::callApi(request, health))
+        return failed(err);
+    if (!health.isObject() || !health["uuid"].isString() || !isUuid(health["uuid"].asString()))
+        return failed(iscsihost::incompleteAnswer(request));
     uuid = health["uuid"].asString();
     return {};
 }
@@ -113,8 +109,8 @@ void endSessionAt(const PairedNode &node)
     request.path = "/api/v1/session";
     request.token = node.token;
     request.pin = node.pin;
-    iscsihost::HttpsAnswer answer;
-    iscsihost::https(request, answer);
+    Json::Value nothing;
+    iscsihost::callApi(request, nothing);
 }
 
 /// Ends the sessions that this appliance opened for a node. They are known by the node's host name, so that one which

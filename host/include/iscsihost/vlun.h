@@ -22,7 +22,7 @@ struct VirtualLun {
     int state = 0;        ///< 0, or the errno value that ended the transfer
 };
 
-/// Every virtual LUN, ascending by UUID.
+/// Every virtual LUN, ascending by age.
 ISCSI_HOST_API int listVirtualLuns(std::vector<VirtualLun> &vluns);
 
 /// The transfer of a LUN that runs or, when none does, the one whose virtual LUN was removed last, as it was then. One
