@@ -3,27 +3,15 @@
 import json
 import os
 import re
-import statistics
-import subprocess
 import sys
-import time
 
+import clones
 import conformance
+import web
 from machines import MIB, PLAIN_TARGET, VOLUME, PlainTgtd, appliance, make_lun, run
+from report import alternate, heading, misses, row, seconds
 
 HERE = os.path.dirname(os.path.abspath(__file__))
-misses = []
-
-
-def row(what, ours, peer, unit, ratio, limit=None):
-    verdict = "" if limit is None else f"  (limit {limit})" if ratio <= limit else f"  ABOVE {limit}"
-    if limit is not None and ratio > limit:
-        misses.append(what)
-    print(f"  {what:<44}{ours:>11.3f} {peer:>11.3f} {unit:<6}{ratio:>7.2f}{verdict}", flush=True)
-
-
-def heading(text):
-    print(f"\n{text}\n  {'':<44}{'ours':>11} {'peer':>11} {'':<6}{'ratio':>7}")
 
 
 def records():
@@ -40,23 +28,6 @@ def records():
     for what, ours, peer in (("toString of one LUN", "recordToString", "plainToString"),
                              ("toJsonFormat of one LUN", "recordToJson", "plainToJson")):
         row(what, median[ours], median[peer], "us", median[ours] / median[peer])
-
-
-def alternate(ours, peer, rounds):
-    """Medians of two measurements taken in turn, so that what disturbs one disturbs the other."""
-    times = [(ours(), peer()) for _ in range(rounds)]
-    return [statistics.median(column) for column in zip(*times)]
-
-
-def seconds(*command, **options):
-    def measure():
-        start = time.perf_counter()
-        done = subprocess.run(command, stdout=subprocess.PIPE, stderr=subprocess.STDOUT, **options)
-        taken = time.perf_counter() - start
-        if done.returncode:
-            raise SystemExit(f"{' '.join(command)}: {done.stdout.decode(errors='replace')[-2000:]}")
-        return taken
-    return measure
 
 
 def listing(count=1024, targets=16):
@@ -85,7 +56,7 @@ def listing(count=1024, targets=16):
         assert len(re.findall(r"Backing store path: /", shown)) == count
         for options, limit in (([], 2), (["--status"], None)):
             command = ["iscsictl", "lun", "list", "--json", *options]
-            ours, peer = alternate(seconds(*command), seconds(*show, env=plain.environment), 15)
+            ours, peer = alternate(seconds(*command), seconds(*show, env=plain.environment), rounds=15)
             row(" ".join(command), ours * 1000, peer * 1000, "ms", ours / peer, limit)
 
 
@@ -97,7 +68,7 @@ def transfers(size=512 * MIB):
 
         def work(*options):
             bench = ("qemu-img", "bench", "-f", "raw", "-t", "none", *options)
-            return alternate(seconds(*bench, ours_url), seconds(*bench, peer_url), 9)
+            return alternate(seconds(*bench, ours_url), seconds(*bench, peer_url), rounds=9)
 
         work("-w", "-c", str(size // (256 << 10)), "-s", "256k", "-d", "8")  # allocates both
         for what, options in (
@@ -116,7 +87,9 @@ def main():
         print("\nThe SCSI test suite (iscsi-test-cu, one process a suite)")
         if conformance.compare():
             misses.append("iscsi-test-cu")
+        web.api_calls()
         listing()
+    clones.remote_clones()
     if misses:
         print(f"\nAbove the limit: {', '.join(misses)}")
     return 1 if misses else 0

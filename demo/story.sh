@@ -30,6 +30,12 @@ do_it() {
     "$@" 2>&1 | indented
 }
 
+# watch_it COMMAND...: the same for a command that has a progress bar for a terminal.
+watch_it() {
+    printf '  $ %s\n' "$*"
+    if [[ -t 2 ]]; then "$@"; else "$@" 2>&1 | indented; fi
+}
+
 # refused PATTERN COMMAND...: shows a command that has to fail and say so.
 refused() {
     local pattern=$1 output
@@ -52,10 +58,10 @@ wrong() {
     exit 1
 }
 
-# as INITIATOR TARGET_IQN LUN: a LUN as qemu's iSCSI initiator is told of it.
+# as INITIATOR TARGET_IQN LUN [ADDRESS]: a LUN as qemu's iSCSI initiator is told of it.
 as() {
     printf 'driver=raw,file.driver=iscsi,file.transport=tcp,file.portal=%s:3260,file.initiator-name=%s,file.target=%s,file.lun=%d' \
-        "$PORTAL" "$1" "$2" "$3"
+        "${4:-$PORTAL}" "$1" "$2" "$3"
 }
 
 checksum() { sha256sum "$1" | cut -d ' ' -f 1; }

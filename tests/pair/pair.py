@@ -5,8 +5,10 @@ initiators run, at 192.0.2.1. Everything ends with the world.
 """
 import json
 import os
+import re
 import secrets
 import signal
+import socket
 import subprocess
 import sys
 import time
@@ -16,6 +18,7 @@ MACHINES = "/run/world/machines"  # NAME -> the process to enter the machine by
 BRIDGE, BRIDGE_ADDRESS = "lan", "192.0.2.1"
 VOLUME = "/mnt/volume1"
 ACCOUNT = "admin"
+WEB_PORT = 5443
 
 
 class Failed(Exception):
@@ -125,16 +128,37 @@ class Machine:
 
 
 class Appliance(Machine):
-    """A machine with a booted and supervised appliance: one volume, one account, the web API."""
+    """A machine with a booted and supervised appliance: one volume, the web API, one account in it."""
 
     def __init__(self, name, address, volume_size="4G"):
         super().__init__(name, address)
         self.password = secrets.token_hex(8)
-        self.run("iscsi-host", "portal", "set", address)
-        self.run("iscsi-host", "volume", "create", VOLUME, "--size", volume_size)
-        self.run("iscsi-host", "boot")
-        self.supervisor = self.start("iscsi-host", "run", stdin=subprocess.DEVNULL, stdout=subprocess.DEVNULL,
-                                     start_new_session=True)
+        self.host("portal", "set", address)
+        self.host("volume", "create", VOLUME, "--size", volume_size)
+        self.host("account", "add", ACCOUNT, "--role", "admin", "--password-file", "-", stdin=self.password + "\n")
+        self.host("boot")
+        self.supervisor = self._serve("iscsi-host", "run")
+        self.start_web()
+
+    def _serve(self, *command):
+        """A program that runs in the foreground, as a service manager would start it."""
+        with open(f"{MACHINES}/{self.name}.log", "a", encoding="utf-8") as log:
+            return self.start(*command, stdin=subprocess.DEVNULL, stdout=log, stderr=log, start_new_session=True)
+
+    def start_web(self):
+        web = self._serve("iscsi-host", "web", "run")
+        wait_until(lambda: self._web_answers() or web.poll() is not None, f"the web server of {self.name} answers")
+        if web.poll() is not None:
+            with open(f"{MACHINES}/{self.name}.log", encoding="utf-8") as log:
+                raise SystemExit(f"the web server of {self.name} ended:\n{log.read()}")
+
+    def stop_web(self):
+        self.kill("lighttpd", signal.SIGTERM)
+        wait_until(lambda: not self.processes("lighttpd"), f"the web server of {self.name} stops")
+
+    def _web_answers(self):
+        with socket.socket() as probe:
+            return probe.connect_ex((self.address, WEB_PORT)) == 0
 
     def iscsictl(self, *arguments, **options):
         """iscsictl's standard output; Failed when it fails."""
@@ -143,14 +167,16 @@ class Appliance(Machine):
     def json(self, *arguments, **options):
         return json.loads(self.iscsictl(*arguments, "--json", **options))
 
-    def refuses(self, *arguments, **options):
-        """Standard error of an iscsictl that has to fail."""
-        result = self.run("iscsictl", *arguments, check=False, **options)
-        assert result.returncode == 1, f"{arguments}: exit status {result.returncode}\n{result.stdout}{result.stderr}"
-        return result.stderr
-
     def host(self, *arguments, **options):
         return self.run("iscsi-host", *arguments, **options).stdout
+
+    def fingerprint(self):
+        """Of the web server's key."""
+        return re.search(r"sha256//\S+", self.host("certificate", "show"))[0]
+
+    def join(self, peer):
+        self.iscsictl("node", "join", peer.address, "--account", ACCOUNT, "--password-file", "-",
+                      "--fingerprint", peer.fingerprint(), stdin=peer.password + "\n")
 
 
 def pair(volume_size="4G"):
