@@ -18,6 +18,7 @@ using iscsihost::HttpsRequest;
 
 constexpr size_t body_max = 64 << 20;
 constexpr size_t headers_max = 64 << 10;
+constexpr const char *too_large = "it is larger than 64 MiB";
 
 /// A connection to one server, for one request.
 class Exchange {
@@ -60,6 +61,7 @@ private:
     char message[CURL_ERROR_SIZE] = "";
 
     size_t header_bytes = 0;
+    bool headers_ended = false;
     std::string body;
     const char *refused = nullptr; ///< why we stopped reading
 };
@@ -140,6 +142,8 @@ int Exchange::request(const HttpsRequest &request, HttpsAnswer &answer)
     set(CURLOPT_WRITEDATA, this);
     if (int err = perform())
         return err;
+    if (!headers_ended) // libcurl takes what there is when the connection ends among them
+        return fail(NORV_ERR_BAD_RESPONSE, "bad answer from %s: its headers are cut short", server.c_str());
 
     long status = 0;
     const char *type = nullptr;
@@ -187,6 +191,8 @@ int Exchange::failed(CURLcode result)
     case CURLE_UNSUPPORTED_PROTOCOL: // what came was no HTTP/1
     case CURLE_WEIRD_SERVER_REPLY:
         return fail(NORV_ERR_BAD_RESPONSE, "bad answer from %s: %s", server.c_str(), why);
+    case CURLE_FILESIZE_EXCEEDED:
+        return fail(NORV_ERR_BAD_RESPONSE, "bad answer from %s: %s", server.c_str(), too_large);
     default:
         if (header_bytes > 0)
             return fail(NORV_ERR_BAD_RESPONSE, "bad answer from %s: %s", server.c_str(), why);
@@ -205,10 +211,11 @@ int Exchange::seenPin(std::string &pin)
     return fail(NORV_ERR_SEND_REQUEST, "%s shows no certificate", server.c_str());
 }
 
-size_t Exchange::takeHeader(char *, size_t size, size_t count, void *exchange)
+size_t Exchange::takeHeader(char *data, size_t size, size_t count, void *exchange)
 {
     auto *self = static_cast<Exchange *>(exchange);
     self->header_bytes += size * count;
+    self->headers_ended = self->headers_ended || *data == '\r' || *data == '\n';
     if (self->header_bytes <= headers_max)
         return size * count;
     self->refused = "its headers are longer than 64 KiB";
@@ -219,7 +226,7 @@ size_t Exchange::takeBody(char *data, size_t size, size_t count, void *exchange)
 {
     auto *self = static_cast<Exchange *>(exchange);
     if (size * count > body_max - self->body.size()) {
-        self->refused = "it is larger than 64 MiB";
+        self->refused = too_large;
         return 0;
     }
     try {
