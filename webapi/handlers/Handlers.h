@@ -21,6 +21,7 @@ Result openSession(const Request &request);
 Result showSession(const Request &request);
 Result closeSession(const Request &request);
 Result showHealth(const Request &request);
+Result showOpenApi(const Request &request);
 
 Result listLuns(const Request &request);
 Result createLun(const Request &request);

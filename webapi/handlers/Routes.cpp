@@ -222,6 +222,7 @@ const std::vector<Route> &routes()
 {
     static const std::vector<Route> table = {
         {Method::Get, "/health", Role::Anyone, NONE, showHealth},
+        {Method::Get, "/openapi.json", Role::Viewer, NONE, showOpenApi},
         {Method::Post, "/session", Role::Anyone, LOGIN, openSession},
         {Method::Get, "/session", Role::Viewer, NONE, showSession},
         {Method::Delete, "/session", Role::Viewer, NONE, closeSession},
