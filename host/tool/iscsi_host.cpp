@@ -1,11 +1,12 @@
 /// iscsi-host: the administrator's tool of the host platform.
 #include "AccountVerbs.h"
 #include "iscsihost/host.h"
+#include "NodeVerbs.h"
+#include "Output.h"
 #include "WebVerbs.h"
 
 #include <CLI/CLI.hpp>
 #include <cstdio>
-#include <iostream>
 #include <json/json.h>
 
 namespace {
@@ -15,12 +16,6 @@ enum {
     exit_failed = 1,
     exit_usage = 2,
 };
-
-int failed(const char *what, int code)
-{
-    fprintf(stderr, "iscsi-host: %s failed: error %d: %s\n", what, code, iscsi_host_last_error());
-    return exit_failed;
-}
 
 std::string sizeText(uint64_t bytes)
 {
@@ -37,11 +32,6 @@ std::string sizeText(uint64_t bytes)
 const char *stateText(const iscsihost::Volume &volume)
 {
     return !volume.mounted ? "not mounted" : volume.read_only ? "read-only" : "ready";
-}
-
-void printJson(const Json::Value &value)
-{
-    std::cout << value.toStyledString();
 }
 
 Json::Value toJson(const iscsihost::Volume &volume)
@@ -79,14 +69,14 @@ void printVolumes(const std::vector<iscsihost::Volume> &volumes)
 int addVolume(const std::string &folder)
 {
     if (int err = iscsihost::addVolume(folder))
-        return failed("volume add", err);
+        return check("volume add", err);
     return exit_ok;
 }
 
 int createVolume(const std::string &folder, uint64_t size, const std::string &image)
 {
     if (int err = iscsihost::createVolume(folder, size, image))
-        return failed("volume create", err);
+        return check("volume create", err);
     return exit_ok;
 }
 
@@ -94,7 +84,7 @@ int listVolumes(bool as_json)
 {
     std::vector<iscsihost::Volume> volumes;
     if (int err = iscsihost::listVolumes(volumes))
-        return failed("volume list", err);
+        return check("volume list", err);
     if (as_json)
         printJson(toJson(volumes));
     else
@@ -106,7 +96,7 @@ int removeVolume(const std::string &folder)
 {
     std::string kept_image;
     if (int err = iscsihost::removeVolume(folder, kept_image))
-        return failed("volume remove", err);
+        return check("volume remove", err);
     if (!kept_image.empty())
         printf("its image file stays: %s\n", kept_image.c_str());
     return exit_ok;
@@ -129,7 +119,7 @@ int init()
 {
     std::string node_uuid;
     if (int err = iscsihost::init(node_uuid))
-        return failed("init", err);
+        return check("init", err);
     printf("node %s\n", node_uuid.c_str());
     return exit_ok;
 }
@@ -151,14 +141,14 @@ int run()
     // Supervision also brings up what boot could not.
     boot();
     if (int err = iscsihost::supervise())
-        return failed("run", err);
+        return check("run", err);
     return exit_ok;
 }
 
 int stop()
 {
     if (int err = iscsihost::stop())
-        return failed("stop", err);
+        return check("stop", err);
     return exit_ok;
 }
 
@@ -168,7 +158,7 @@ int setPortal(const std::vector<std::string> &addresses)
     for (const std::string &address : addresses)
         joined += (joined.empty() ? "" : " ") + address;
     if (int err = iscsihost::setPortal(joined))
-        return failed("portal set", err);
+        return check("portal set", err);
     return exit_ok;
 }
 
@@ -176,7 +166,7 @@ int showStatus(bool as_json)
 {
     iscsihost::Status status;
     if (int err = iscsihost::status(status))
-        return failed("status", err);
+        return check("status", err);
     if (as_json) {
         Json::Value json;
         json["service_alive"] = status.service_alive;
@@ -217,7 +207,7 @@ int runDue()
             printf("snapshot of LUN %d (%s) taken\n", run.schedule.lid, run.schedule.lun_name.c_str());
     }
     if (err && runs.empty())
-        return failed("schedule run-due", err);
+        return check("schedule run-due", err);
     return err ? exit_failed : exit_ok;
 }
 
@@ -281,6 +271,7 @@ int runTool(int argc, char **argv)
 
     addWebVerbs(app, status);
     addAccountVerbs(app, status);
+    addNodeVerbs(app, status);
 
     try {
         app.parse(argc, argv);
