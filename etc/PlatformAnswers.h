@@ -8,7 +8,6 @@
 
 #include <cstdlib>
 #include <memory>
-#include <search.h>
 
 namespace ISCSI {
 
@@ -70,7 +69,9 @@ struct TaskRecords {
         _tag_iscsi_task_ *record = head.forward;
         if (!record || record == &head) // a queue ends in null, or is a ring
             return nullptr;
-        remque(record);
+        head.forward = record->forward;
+        if (head.forward)
+            head.forward->backward = &head;
         return TaskRecord(record);
     }
 };

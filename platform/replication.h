@@ -21,7 +21,7 @@ typedef struct _tag_iscsi_task_ {
     char root_path[320];
     char parent_task_uuid[37];
     char padding_543[1];
-    struct _tag_iscsi_task_ *forward; ///< links of a queue, as insque() and remque() take them
+    struct _tag_iscsi_task_ *forward; ///< links of a queue: the next record and the previous one
     struct _tag_iscsi_task_ *backward;
 } _tag_iscsi_task_;
 

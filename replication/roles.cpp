@@ -93,7 +93,8 @@ int ISCSILIBReplication::deleteReplication(bool delete_sink_lun)
         return fail(err, task, "Failed to load replication task");
     if (!task.is_source && delete_sink_lun) {
         const int err = ISCSILIBLUN(task.dst_lun.uuid).deleteLUN();
-        if (err != 0 && err != ERR_FAILED_TO_LOAD_LUN_CONFIG)
+        const bool is_gone = err == ERR_FAILED_TO_LOAD_LUN_CONFIG || err == ERR_NO_SUCH_LUN;
+        if (err != 0 && !is_gone)
             fail(err, task, "Failed to delete sink LUN");
     } else if (!task.is_source) {
         _tag_iscsi_lun_ lun{};

@@ -3,8 +3,6 @@
 #include "platform/virtual_lun.h"
 #include "tests/fake/Script.h"
 
-#include <search.h>
-
 #include <cstdlib>
 
 using namespace fake;
@@ -118,8 +116,9 @@ int NORViSCSIReplicationTaskConfLoad(const _tag_iscsi_task_selection_ *selection
             return NORV_ERR_OUT_OF_MEMORY;
         noteListed(record);
         *record = task.record;
-        insque(record, last);
-        last = record;
+        record->forward = nullptr;
+        record->backward = last;
+        last = last->forward = record;
         ++*count;
         if (failure)
             break; // part of an answer is the caller's to free too

@@ -83,7 +83,7 @@ private:
         std::atomic<uint32_t> room{0};
         uint32_t length = 0;
     };
-    static constexpr size_t CAPACITY = 8 << 20;
+    static constexpr size_t CAPACITY = 16 << 20;
 
     Header *header;
     char *entries;
