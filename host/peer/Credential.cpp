@@ -18,7 +18,8 @@ constexpr const char *session_path = "/api/v1/session";
 /// Overwrites a secret before its memory is used for something else.
 void wipe(std::string &text)
 {
-    explicit_bzero(text.data(), text.capacity());
+    text.resize(text.capacity()); // a longer one may have stood there
+    explicit_bzero(text.data(), text.size());
     text.clear();
 }
 

@@ -88,7 +88,6 @@ int Exchange::begin(const std::string &protocol, const std::string &path, int co
     set(CURLOPT_HTTP_VERSION, static_cast<long>(CURL_HTTP_VERSION_1_1));
     set(CURLOPT_FOLLOWLOCATION, 0L);
     set(CURLOPT_PROXY, "");
-    set(CURLOPT_NOSIGNAL, 1L);
     set(CURLOPT_SSLVERSION, static_cast<long>(CURL_SSLVERSION_TLSv1_2));
     set(CURLOPT_CERTINFO, 1L);
     set(CURLOPT_CONNECTTIMEOUT, static_cast<long>(connect_seconds));

@@ -4,6 +4,7 @@
 #include "platform/error.h"
 
 #include <dlfcn.h>
+#include <mutex>
 #include <openssl/opensslv.h>
 
 namespace norvhost {
@@ -78,6 +79,8 @@ bool load(LibCrypto &crypto)
 template <class Functions>
 const Functions *loaded()
 {
+    static std::mutex one_at_a_time;
+    const std::lock_guard<std::mutex> lock(one_at_a_time);
     static Functions functions;
     static bool done = false;
     done = done || load(functions);

@@ -138,7 +138,11 @@ TEST_F(HttpsTest, BadAnswersAreRefused)
         EXPECT_THAT(reason(), HasSubstr("64 MiB")) << behaviour;
     }
     EXPECT_EQ(NORV_ERR_SEND_REQUEST, send("closed"));
-    EXPECT_EQ(0, answer.status); // none of them touched it
+    EXPECT_EQ(0, answer.status);      // none of them touched it
+    HttpsRequest large = ask("deaf"); // hangs up while we send
+    large.method = "POST";
+    large.body.assign(32 << 20, ' ');
+    EXPECT_EQ(NORV_ERR_SEND_REQUEST, send(large));
     EXPECT_EQ(0, send("redirect")) << reason();
     EXPECT_EQ(302, answer.status);
 }

@@ -86,6 +86,8 @@ class Handler(socketserver.StreamRequestHandler):
         if not lines:
             return
         method, path, _ = lines[0].split(" ")
+        if path.endswith("/deaf"):
+            return
         length = sum(int(line.split(":")[1]) for line in lines if line.lower().startswith("content-length:"))
         body = self.rfile.read(length).decode("latin-1")
         name = path.split("/")[-1].split("?")[0]
