@@ -32,6 +32,8 @@ if(TARGET norvhost)
     install_programs(${webapi_folder}/cgi iscsi-webapi)
     install(FILES webapi/lighttpd/iscsi-webapi.conf DESTINATION ${webapi_folder})
     install(DIRECTORY webapi/lighttpd/errors DESTINATION ${webapi_folder})
+    install(FILES ${PROJECT_BINARY_DIR}/webapi/openapi/openapi.json DESTINATION ${CMAKE_INSTALL_DATADIR}/iscsi-host)
+    add_dependencies(product openapi)
     # The library's node configuration file lives here; it holds tokens.
     install(DIRECTORY DESTINATION norv/etc DIRECTORY_PERMISSIONS OWNER_READ OWNER_WRITE OWNER_EXECUTE)
 endif()

@@ -53,6 +53,15 @@ Result changeSnapshot(const Request &request, Act act)
     return describe(snapshot.uuid);
 }
 
+/// Who is said to act: whom the request names, else the session's account; empty, for the library's default, in a
+/// process of the machine's own.
+std::string actor(const Request &request, const char *field)
+{
+    constexpr size_t ACTOR_MAX_BYTES = 31; // what fits the SDK's record
+    const std::string named = request.input[field].asString();
+    return named.empty() && !request.token.empty() ? request.account.substr(0, ACTOR_MAX_BYTES) : named;
+}
+
 /// The lock of the user, or of an application when the request names its key.
 Result setLock(const Request &request, bool locked)
 {
@@ -125,7 +134,7 @@ Result takeSnapshot(const Request &request)
     int id = 0;
     if (int err =
             lun.takeSnapshot(in["is_app_consistent"].asBool(), in["is_user_locked"].asBool(), in["name"].asString(),
-                             in["description"].asString(), in["taken_by"].asString(),
+                             in["description"].asString(), actor(request, "taken_by"),
                              point_in_time ? point_in_time : time(nullptr), in["is_scheduled"].asBool(), uuid, id))
         return failed(err);
     return describe(uuid);
@@ -143,7 +152,7 @@ Result deleteSnapshot(const Request &request)
     if (Result bad = selectSnapshot(request, snapshot, lun_uuid); bad.code)
         return bad;
     ISCSILIBLUN lun(lun_uuid);
-    if (int err = lun.deleteSnapshot(snapshot.uuid, request.input["deleted_by"].asString()))
+    if (int err = lun.deleteSnapshot(snapshot.uuid, actor(request, "deleted_by")))
         return failed(err);
     return {};
 }
