@@ -50,6 +50,7 @@ std::unique_ptr<Commands> makeCommands()
     addTargetVerbs(*commands);
     addNodeVerbs(*commands);
     addVlunVerbs(*commands);
+    addReplicationVerbs(*commands);
     addSessionVerbs(*commands);
 
     CLI::App &completion = addNoun(*commands, "completion", "Print a script that completes words for a shell");

@@ -29,6 +29,7 @@ void addTransferVerbs(Commands &commands); ///< of the nouns "lun" and "snapshot
 void addUpkeepVerbs(Commands &commands);
 void addNodeVerbs(Commands &commands);
 void addVlunVerbs(Commands &commands); ///< some of the noun "lun", which exists
+void addReplicationVerbs(Commands &commands);
 void addSessionVerbs(Commands &commands);
 
 /// What most verbs take.

@@ -108,6 +108,9 @@ int iscsihost::beginReception(const std::string &task_uuid, const Incoming &inco
     Reception begun;
     if (int err = destination.load(task_uuid))
         return err;
+    // Whoever was sending before is gone: the source lets one send at a time.
+    if (int err = shutSink(destination.lun.record.uuid))
+        return err;
     if (!goOn(destination, incoming, begun)) {
         if (int err = prepare(destination, incoming, begun))
             return err;
@@ -121,6 +124,14 @@ int iscsihost::beginReception(const std::string &task_uuid, const Incoming &inco
         return err;
     reception = begun;
     return 0;
+}
+
+int iscsihost::breakReception(const std::string &task_uuid)
+{
+    TaskRow task;
+    if (int err = loadTask(task_uuid, task))
+        return err;
+    return task.record.is_source ? 0 : shutSink(task.localLun());
 }
 
 int iscsihost::noteReception(const std::string &task_uuid, const std::string &version, uint64_t offset, uint64_t moved,

@@ -8,7 +8,7 @@
 #include "host/storage/MapFile.h"
 #include "host/storage/SnapshotStore.h"
 #include "host/storage/Versions.h"
-#include "host/transfer/Sinks.h"
+#include "iscsihost/sink.h"
 #include "platform/error.h"
 #include "platform/iscsi_snapshot.h"
 
@@ -46,7 +46,7 @@ int changeKind(const LunRow &lun, int type, Change also)
 /// Leaves a sink's LUN with a whole state.
 int settle(const LunRow &lun)
 {
-    if (int err = dropSink(lun.record.uuid))
+    if (int err = shutSink(lun.record.uuid))
         return err;
     const std::string path = dataPath(lun.record);
     Versions versions;
@@ -70,6 +70,12 @@ int settle(const LunRow &lun)
 
 } // namespace
 
+int shutSink(const std::string &lun_uuid)
+{
+    const int err = iscsihost::closeSink(lun_uuid, "", false);
+    return err == NORV_ERR_NO_SUCH_TARGET ? 0 : err;
+}
+
 int setBackTo(const LunRow &lun, std::string_view version)
 {
     std::vector<SnapshotRow> snapshots;
@@ -89,7 +95,7 @@ int setBackTo(const LunRow &lun, std::string_view version)
     return finishSynchronisation(path);
 }
 
-int makeOrdinary(const LunRow &lun)
+int releaseSink(const LunRow &lun)
 {
     if (lun.record.type != NORV_LUN_TYPE_SINK)
         return 0;

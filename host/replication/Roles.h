@@ -16,7 +16,10 @@ int becomeSource(TaskRow &task);
 int becomeDestination(TaskRow &task);
 
 /// Turns a sink into an ordinary LUN with the last whole state that it received.
-int makeOrdinary(const LunRow &lun);
+int releaseSink(const LunRow &lun);
+
+/// Shuts out whoever is writing to the sink, as incomplete; none is no failure.
+int shutSink(const std::string &lun_uuid);
 
 /// Sets the LUN back to its snapshot of that version: NORV_ERR_NO_SUCH_SNAPSHOT when it has none.
 int setBackTo(const LunRow &lun, std::string_view version);

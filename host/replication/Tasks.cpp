@@ -166,7 +166,7 @@ int NORViSCSILunConvertSinkToAdv(const _tag_iscsi_lun_ *lun)
     LunRow row;
     if (int err = loadLunByLid(lun->lid, row))
         return err;
-    return makeOrdinary(row);
+    return releaseSink(row);
 }
 
 int NORViSCSIReplicationTaskProgressGetByTask(const _tag_iscsi_task_ *task, _tag_iscsi_task_progress_ *progress)

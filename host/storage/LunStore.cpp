@@ -178,6 +178,12 @@ int updateLun(const LunRow &row)
     return transaction.commit();
 }
 
+int updateLunType(int lid, int type)
+{
+    Query query("UPDATE luns SET type = ?2 WHERE lid = ?1");
+    return query.bind(lid).bind(type).run();
+}
+
 int removeLun(int lid)
 {
     Transaction transaction;

@@ -41,6 +41,9 @@ int insertLun(const LunRow &row);
 /// With the trash option newly set, NORV_ERR_LUN_MAPPED while it is mapped.
 int updateLun(const LunRow &row);
 
+/// Stores the kind of an existing row.
+int updateLunType(int lid, int type);
+
 /// Removes the row with the LUN's snapshots, schedules and retention policy; NORV_ERR_LUN_MAPPED while it is mapped,
 /// NORV_ERR_LUN_LOCKED while a virtual LUN is over it, and the codes of removeSnapshot() while one of its snapshots is
 /// locked.

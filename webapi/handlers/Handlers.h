@@ -83,6 +83,26 @@ Result trustNode(const Request &request);
 Result loginNode(const Request &request);
 Result logoutNode(const Request &request);
 
+Result listReplications(const Request &request);
+Result createReplication(const Request &request);
+Result createReplicationTask(const Request &request);
+Result showReplication(const Request &request);
+Result deleteReplication(const Request &request);
+Result showSending(const Request &request);
+Result sendReplication(const Request &request);
+Result stopReplication(const Request &request);
+Result countUnsynced(const Request &request);
+Result showUnsynced(const Request &request);
+Result promoteReplication(const Request &request);
+Result demoteReplication(const Request &request);
+Result checkReplicationNode(const Request &request);
+
+// What a peer's sending asks for.
+Result chooseBaseVersion(const Request &request);
+Result beginReception(const Request &request);
+Result noteReception(const Request &request);
+Result endReception(const Request &request);
+
 Result listVluns(const Request &request);
 Result createVlun(const Request &request);
 Result showVlun(const Request &request);

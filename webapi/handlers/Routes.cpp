@@ -25,8 +25,10 @@ constexpr uint64_t NOTE_MAX_BYTES = 1023;
 constexpr uint64_t ACTOR_MAX_BYTES = 31;
 constexpr uint64_t APP_KEY_MAX_BYTES = 127;
 constexpr uint64_t RULE_MAX_BYTES = 255;
-constexpr uint64_t EVENTS_MAX = 10000; // as many as are kept
-constexpr uint64_t MAX_MASKS = 1024;   // bounds the work of one request
+constexpr uint64_t EVENTS_MAX = 10000;                // as many as are kept
+constexpr uint64_t MAX_SNAPSHOTS = 256;               // of one LUN
+constexpr uint64_t SNAPSHOT_SELECTOR_MAX_BYTES = 511; // LUN's name, '_', snapshot's name
+constexpr uint64_t MAX_MASKS = 1024;                  // bounds the work of one request
 constexpr uint64_t MAX_NODES = 256;
 constexpr uint64_t MAX_PORTALS = 16;
 constexpr uint64_t HOST_MAX_BYTES = 253; // RFC 1035, 3.1, as text
@@ -214,6 +216,70 @@ constexpr Field REMOTE_CLONE[] = {
     {"watch", Type::Boolean, OPTIONAL, 0, 0, 0}, // true unless it is given
 };
 
+constexpr Field REPLICATION_CREATE[] = {
+    {"lun", Type::Text, REQUIRED, 1, NAME_MAX_BYTES, ERR_BAD_LUN_UUID},
+    {"node", Type::Text, REQUIRED, 1, HOST_MAX_BYTES, ERR_BAD_NODE_UUID},
+    {"location", Type::Text, REQUIRED, 1, LOCATION_MAX_BYTES, ERR_BAD_LUN_LOCATION},
+    {"name", Type::Text, REQUIRED, 1, NAME_MAX_BYTES, ERR_BAD_LUN_NAME},
+};
+
+constexpr Field TASK_CREATE[] = {
+    {"uuid", Type::Text, REQUIRED, UUID_BYTES, UUID_BYTES, ERR_BAD_REPLICATION_TASK_UUID},
+    {"is_source", Type::Boolean, REQUIRED, 0, 0, 0},
+    {"src_lun_uuid", Type::Text, REQUIRED, UUID_BYTES, UUID_BYTES, ERR_REPLICATION_BAD_SOURCE_LUN_UUID},
+    {"dst_lun_uuid", Type::Text, REQUIRED, UUID_BYTES, UUID_BYTES, ERR_REPLICATION_BAD_DESTINATION_LUN_UUID},
+    {"src_node_uuid", Type::Text, REQUIRED, UUID_BYTES, UUID_BYTES, ERR_BAD_SOURCE_NODE_UUID},
+    {"dst_node_uuid", Type::Text, REQUIRED, UUID_BYTES, UUID_BYTES, ERR_BAD_DESTINATION_NODE_UUID},
+};
+
+constexpr Field REPLICATION_SHOW[] = {
+    {"additional", Type::Boolean, OPTIONAL, 0, 0, 0},
+};
+
+constexpr Field REPLICATION_SEND[] = {
+    {"snapshot", Type::Text, REQUIRED, 1, SNAPSHOT_SELECTOR_MAX_BYTES, ERR_BAD_SENDING_SNAPSHOT_UUID},
+    {"address", Type::Text, OPTIONAL, 0, HOST_MAX_BYTES, ERR_BAD_DESTINATION_ADDRESS},
+    {"port", Type::Unsigned, OPTIONAL, 0, UINT16_MAX, ERR_BAD_DESTINATION_PORT},
+    {"encrypted", Type::Boolean, OPTIONAL, 0, 0, 0},
+};
+
+constexpr Field UNSYNCED[] = {
+    {"snapshot", Type::Text, REQUIRED, 1, SNAPSHOT_SELECTOR_MAX_BYTES, ERR_BAD_SENDING_SNAPSHOT_UUID},
+    {"base", Type::Text, OPTIONAL, 0, SNAPSHOT_SELECTOR_MAX_BYTES, ERR_BAD_BASE_SNAPSHOT_UUID},
+};
+
+constexpr Field VERSION[] = {
+    {"uuid", Type::Text, REQUIRED, UUID_BYTES, UUID_BYTES, ERR_BAD_SOURCE_SNAPSHOTS},
+    {"version", Type::Text, REQUIRED, 1, UUID_BYTES, ERR_BAD_SOURCE_SNAPSHOTS},
+};
+constexpr Field VERSION_ELEMENT[] = {{"", Type::Object, REQUIRED, 0, 0, 0, nullptr, VERSION}};
+constexpr Field VERSIONS[] = {
+    {"snapshots", Type::List, REQUIRED, 0, MAX_SNAPSHOTS, ERR_BAD_SOURCE_SNAPSHOTS, nullptr, VERSION_ELEMENT},
+};
+
+constexpr Field ARRIVAL_BEGIN[] = {
+    {"version", Type::Text, REQUIRED, UUID_BYTES, UUID_BYTES, ERR_BAD_SENDING_SNAPSHOT_UUID},
+    {"base", Type::Text, OPTIONAL, 0, UUID_BYTES, ERR_BAD_BASE_SNAPSHOT_UUID},
+};
+constexpr Field ARRIVAL[] = {
+    {"version", Type::Text, REQUIRED, UUID_BYTES, UUID_BYTES, ERR_BAD_SENDING_SNAPSHOT_UUID},
+    {"offset", Type::Unsigned, REQUIRED, 0, INT64_MAX, ERR_BAD_PARAMETER},
+    {"moved", Type::Unsigned, REQUIRED, 0, INT64_MAX, ERR_BAD_PARAMETER},
+    {"total", Type::Unsigned, REQUIRED, 0, INT64_MAX, ERR_BAD_PARAMETER},
+};
+constexpr Field ARRIVAL_END[] = {
+    {"version", Type::Text, REQUIRED, UUID_BYTES, UUID_BYTES, ERR_BAD_SENDING_SNAPSHOT_UUID},
+};
+
+constexpr Field REPLICATION_DELETE[] = {
+    {"delete_lun", Type::Boolean, OPTIONAL, 0, 0, 0},
+};
+
+constexpr Field CONNECTION[] = {
+    {"address", Type::Text, REQUIRED, 1, HOST_MAX_BYTES, ERR_BAD_DESTINATION_ADDRESS},
+    {"port", Type::Unsigned, OPTIONAL, 0, UINT16_MAX, ERR_BAD_DESTINATION_PORT},
+};
+
 constexpr Fields NONE;
 
 } // namespace
@@ -282,6 +348,23 @@ const std::vector<Route> &routes()
         {Method::Post, "/nodes/{node}/login", Role::Admin, NODE_LOGIN, loginNode},
         {Method::Post, "/nodes/{node}/logout", Role::Admin, NONE, logoutNode},
         {Method::Get, "/peer-key", Role::Admin, PEER, showPeerKey},
+        {Method::Post, "/nodes/{node}/check", Role::Admin, CONNECTION, checkReplicationNode},
+        {Method::Get, "/replications", Role::Viewer, NONE, listReplications},
+        {Method::Post, "/replications", Role::Admin, REPLICATION_CREATE, createReplication},
+        {Method::Post, "/replications/tasks", Role::Admin, TASK_CREATE, createReplicationTask},
+        {Method::Get, "/replications/{task}", Role::Viewer, REPLICATION_SHOW, showReplication},
+        {Method::Delete, "/replications/{task}", Role::Admin, REPLICATION_DELETE, deleteReplication},
+        {Method::Get, "/replications/{task}/sending", Role::Viewer, NONE, showSending},
+        {Method::Post, "/replications/{task}/send", Role::Admin, REPLICATION_SEND, sendReplication},
+        {Method::Post, "/replications/{task}/stop", Role::Admin, NONE, stopReplication},
+        {Method::Get, "/replications/{task}/unsynced", Role::Viewer, NONE, showUnsynced},
+        {Method::Post, "/replications/{task}/unsynced", Role::Admin, UNSYNCED, countUnsynced},
+        {Method::Post, "/replications/{task}/promote", Role::Admin, NONE, promoteReplication},
+        {Method::Post, "/replications/{task}/demote", Role::Admin, NONE, demoteReplication},
+        {Method::Post, "/replications/{task}/base-version", Role::Admin, VERSIONS, chooseBaseVersion},
+        {Method::Post, "/replications/{task}/arrival", Role::Admin, ARRIVAL_BEGIN, beginReception},
+        {Method::Patch, "/replications/{task}/arrival", Role::Admin, ARRIVAL, noteReception},
+        {Method::Post, "/replications/{task}/arrival/end", Role::Admin, ARRIVAL_END, endReception},
         {Method::Get, "/vluns", Role::Viewer, NONE, listVluns},
         {Method::Post, "/vluns", Role::Admin, VLUN_CREATE, createVlun},
         {Method::Get, "/vluns/{uuid}", Role::Viewer, NONE, showVlun},

@@ -30,6 +30,9 @@ struct Reception {
 /// NORV_ERR_NOT_A_DESTINATION_TASK, NORV_ERR_LUN_LOCKED.
 ISCSI_HOST_API int beginReception(const std::string &task_uuid, const Incoming &incoming, Reception &reception);
 
+/// Shuts out a sender that was killed, so that its LUN is not locked by it any more.
+ISCSI_HOST_API int breakReception(const std::string &task_uuid);
+
 /// What lies below `offset` has arrived and is flushed; `moved` bytes of `total`. NORV_ERR_BASE_SNAPSHOT when another
 /// state is arriving.
 ISCSI_HOST_API int noteReception(const std::string &task_uuid, const std::string &version, uint64_t offset,

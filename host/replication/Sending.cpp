@@ -1,0 +1,464 @@
+#include "host/replication/Sending.h"
+
+#include "host/core/Crypto.h"
+#include "host/core/LastError.h"
+#include "host/core/Lock.h"
+#include "host/peer/Address.h"
+#include "host/replication/Difference.h"
+#include "host/state/Fields.h"
+#include "host/storage/LunStore.h"
+#include "host/storage/SnapshotFiles.h"
+#include "host/storage/SnapshotStore.h"
+#include "host/target/Sinks.h"
+#include "host/transfer/Sending.h"
+#include "iscsihost/https.h"
+#include "iscsihost/node.h"
+#include "platform/core.h"
+#include "platform/dr_node.h"
+#include "platform/error.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <chrono>
+#include <cstring>
+#include <iscsi/iscsi.h>
+#include <json/json.h>
+#include <memory>
+#include <syslog.h>
+#include <thread>
+#include <unistd.h>
+
+namespace norvhost {
+namespace {
+
+using iscsihost::HttpsRequest;
+using iscsihost::PairedNode;
+using Clock = std::chrono::steady_clock;
+
+constexpr int RUNNING = -EINPROGRESS; // stored while a sender works: with its lock free it was killed
+constexpr int KILLED = -EPIPE;
+constexpr int STOPPED = -ENODEV;
+constexpr uint64_t UNIT = 512; // what is said to be sent where nothing differs
+constexpr uint64_t FLUSH_INTERVAL = 256 << 20;
+
+std::string lockName(const char *task_uuid)
+{
+    return std::string("sending-") + task_uuid;
+}
+
+std::string textOf(const char *text)
+{
+    return text ? text : "";
+}
+
+/// What is asked of the peer's web API.
+class PeerApi {
+public:
+    int open(const char *node_uuid) { return iscsihost::describePairedNode(node_uuid, node); }
+
+    int call(const char *method, const std::string &path, const Json::Value &body, Json::Value &answer) const
+    {
+        HttpsRequest request;
+        request.host = node.host;
+        request.port = node.port;
+        request.protocol = node.protocol;
+        request.token = node.token;
+        request.method = method;
+        request.path = "/api/v1" + path;
+        Json::StreamWriterBuilder builder;
+        builder["indentation"] = "";
+        request.body = Json::writeString(builder, body);
+        return iscsihost::callApi(request, answer);
+    }
+
+    const std::string &host() const { return node.host; }
+
+private:
+    PairedNode node;
+};
+
+/// The peer's sink, open until the object ends.
+class PeerSink {
+public:
+    PeerSink(const PeerApi &api, const char *lun_uuid) : api(api), path(std::string("/sinks/") + lun_uuid) {}
+    PeerSink(const PeerSink &) = delete;
+    ~PeerSink() { close(false); }
+
+    int open(const std::string &rod_key, const std::string &lun_uuid, const std::string &portal)
+    {
+        Json::Value answer;
+        if (int err = api.call("POST", path + "/open", Json::objectValue, answer))
+            return err;
+        const Json::Value &number = answer["lun"];
+        if (!answer["portal"].isString() || !answer["iqn"].isString() || !number.isInt())
+            return fail(NORV_ERR_BAD_RESPONSE, "the peer opens its sink without saying where");
+        iqn = answer["iqn"].asString();
+        const SinkLogIn log_in = sinkLogIn(rod_key, lun_uuid);
+        unit.portal = portal.empty() ? answer["portal"].asString() : portal;
+        if (unit.portal.rfind(':', 0) == 0) // it listens on all its addresses
+            unit.portal =
+                (api.host().find(':') == std::string::npos ? api.host() : "[" + api.host() + "]") + unit.portal;
+        unit.target = iqn;
+        unit.lun = number.asInt();
+        unit.initiator = log_in.initiator;
+        unit.user = log_in.user;
+        unit.secret = log_in.secret;
+        unit.mutual_user = log_in.mutual_user;
+        unit.mutual_secret = log_in.mutual_secret;
+        return 0;
+    }
+
+    int close(bool complete)
+    {
+        if (iqn.empty())
+            return 0;
+        Json::Value body(Json::objectValue), answer;
+        body["iqn"] = iqn;
+        body["complete"] = complete;
+        iqn.clear();
+        return api.call("POST", path + "/close", body, answer);
+    }
+
+    const IscsiUnit &where() const { return unit; }
+
+private:
+    const PeerApi &api;
+    std::string path;
+    std::string iqn;
+    IscsiUnit unit;
+};
+
+/// One sending: prepared in the caller's process, carried out in a worker.
+class Sender {
+public:
+    int prepare(const _tag_iscsi_task_ &task, const char *snapshot_uuid, const char *base_version);
+    void run();
+    /// After a fork(), in the caller: the locks are the worker's.
+    void leaveToChild()
+    {
+        snapshot_lock.leaveToChild();
+        base_lock.leaveToChild();
+    }
+
+    std::string portal; ///< of the peer's data; empty: the one that it gives
+    std::string rod_key;
+
+private:
+    int send();
+    int describe(const Json::Value &reception);
+    int sendRanges(const PeerSink &sink);
+    int note(uint64_t offset);
+    int tell(uint64_t moved);
+    std::string arrivalPath() const { return std::string("/replications/") + task.record.uuid + "/arrival"; }
+
+    NamedLock lock;
+    SnapshotLock snapshot_lock, base_lock;
+    TaskRow task;
+    SnapshotRow snapshot, base;
+    FileDescriptor file, base_file;
+    PeerApi api;
+    std::vector<DataRange> ranges;
+    uint64_t total = 0, moved_before = 0, offset = 0;
+    bool to_zeros = false;
+    Clock::time_point told{};
+};
+
+int findByVersion(int lid, const std::string &version, SnapshotRow &row)
+{
+    std::vector<SnapshotRow> rows;
+    if (int err = loadSnapshotsOfLun(lid, rows))
+        return err;
+    const auto found =
+        std::find_if(rows.begin(), rows.end(), [&](const SnapshotRow &one) { return one.record.version == version; });
+    if (found == rows.end())
+        return fail(NORV_ERR_BASE_SNAPSHOT, "the LUN has no snapshot of the version %s any more", version.c_str());
+    row = *found;
+    return 0;
+}
+
+int Sender::prepare(const _tag_iscsi_task_ &wanted, const char *snapshot_uuid, const char *base_version)
+{
+    if (int err = loadTask(std::string_view(wanted.uuid, strnlen(wanted.uuid, sizeof wanted.uuid)), task))
+        return err;
+    if (!task.record.is_source)
+        return fail(NORV_ERR_NOT_A_SOURCE_TASK, "the task %s is a destination here", task.record.uuid);
+    if (int err = lock.tryTake(lockName(task.record.uuid)))
+        return err;
+    if (!lock.held())
+        return fail(NORV_ERR_TASK_LOCKED, "the task %s is sending a snapshot already", task.record.uuid);
+    LunRow lun;
+    if (int err = loadLunByUuid(task.localLun(), lun))
+        return err;
+    if (int err = loadSnapshotByUuid(snapshot_uuid, snapshot))
+        return err;
+    if (snapshot.record.lid != lun.record.lid)
+        return fail(NORV_ERR_NO_SUCH_SNAPSHOT, "the snapshot '%s' is not one of LUN '%s'", snapshot.record.name,
+                    lun.record.name);
+    if (int err = snapshot_lock.take(lun.record.lid, snapshot.record.snap_id, NORV_LUN_PROCESSING))
+        return err;
+    if (int err = openSnapshotData(snapshot.record, file))
+        return err;
+    if (base_version) {
+        if (int err = findByVersion(lun.record.lid, base_version, base))
+            return err;
+        if (base.record.snap_id != snapshot.record.snap_id) {
+            if (int err = base_lock.take(lun.record.lid, base.record.snap_id, NORV_LUN_PROCESSING))
+                return err;
+        }
+        if (int err = openSnapshotData(base.record, base_file))
+            return err;
+    }
+    if (int err = api.open(task.remoteNode()))
+        return err;
+    if (int err = requestStop(task.record.uuid, false))
+        return err;
+    task.progress.sent_size = task.progress.send_total_size = task.progress.progress_value = 0;
+    task.progress.error = RUNNING;
+    return updateProgress(task.progress);
+}
+
+void Sender::run()
+{
+    task.progress.error = send();
+    if (task.progress.error && task.progress.error != STOPPED)
+        syslog(LOG_ERR, "sending the snapshot '%s' failed: %s", snapshot.record.name, lastError());
+    updateProgress(task.progress);
+}
+
+int Sender::send()
+{
+    Json::Value body(Json::objectValue), reception, answer;
+    body["version"] = snapshot.record.version;
+    body["base"] = base_file ? base.record.version : "";
+    if (int err = api.call("POST", arrivalPath(), body, reception))
+        return err;
+    if (int err = describe(reception))
+        return err;
+    PeerSink sink(api, task.record.dst_lun_uuid);
+    if (int err = sink.open(rod_key, task.record.dst_lun_uuid, portal))
+        return err;
+    if (int err = sendRanges(sink))
+        return err;
+    if (int err = sink.close(true))
+        return err;
+    Json::Value end(Json::objectValue);
+    end["version"] = snapshot.record.version;
+    if (int err = api.call("POST", arrivalPath() + "/end", end, answer))
+        return err;
+    task.progress.sent_size = task.progress.send_total_size = total;
+    task.progress.progress_value = 100;
+    return 0;
+}
+
+int Sender::describe(const Json::Value &reception)
+{
+    const Json::Value &holding = reception["holding"];
+    if (!holding.isString() || !reception["offset"].isUInt64())
+        return fail(NORV_ERR_BAD_RESPONSE, "the peer does not say what its LUN holds");
+    const uint64_t size = snapshot.record.total_size;
+    to_zeros = holding == "zeros";
+    offset = reception["offset"].asUInt64();
+    const bool from_base = holding == "base" && base_file;
+    if (int err = holding == "unknown" || (holding == "base" && !base_file)
+                      ? describeWhole(file.get(), size, ranges)
+                      : findDifference(from_base ? base_file.get() : -1, file.get(), size, ranges))
+        return err;
+    total = std::max(dataBytes(ranges), UNIT);
+    for (const DataRange &range : ranges)
+        if (!range.zeros && range.offset < offset)
+            moved_before += std::min(range.length, offset - range.offset);
+    return tell(0);
+}
+
+int Sender::sendRanges(const PeerSink &sink)
+{
+    size_t at = 0;
+    while (at < ranges.size() && ranges[at].offset + ranges[at].length <= offset)
+        ++at;
+    while (at < ranges.size()) {
+        uint64_t budget = FLUSH_INTERVAL;
+        norvhost::Sending sending;
+        sending.to = sink.where();
+        sending.from = file.get();
+        sending.to_zeros = to_zeros;
+        sending.progress = [&](uint64_t moved) { return tell(moved); };
+        sending.next = [&](DataRange &range) {
+            range = {};
+            if (at == ranges.size() || budget == 0)
+                return 0;
+            const DataRange &whole = ranges[at];
+            range = whole;
+            range.offset = std::max(whole.offset, offset);
+            range.length = whole.offset + whole.length - range.offset;
+            if (!range.zeros) {
+                range.length = std::min(range.length, budget);
+                budget -= range.length;
+            }
+            offset = range.offset + range.length;
+            if (offset == whole.offset + whole.length)
+                ++at;
+            return 0;
+        };
+        if (int err = norvhost::sendRanges(sending))
+            return err;
+        moved_before += FLUSH_INTERVAL - budget;
+        if (int err = note(offset))
+            return err;
+    }
+    return 0;
+}
+
+/// What lies below the place is flushed on the peer.
+int Sender::note(uint64_t flushed)
+{
+    Json::Value body(Json::objectValue), answer;
+    body["version"] = snapshot.record.version;
+    body["offset"] = Json::UInt64(flushed);
+    body["moved"] = Json::UInt64(moved_before);
+    body["total"] = Json::UInt64(total);
+    if (int err = api.call("PATCH", arrivalPath(), body, answer))
+        return err;
+    return tell(0);
+}
+
+int Sender::tell(uint64_t moved)
+{
+    const auto now = Clock::now();
+    if (now - told < std::chrono::milliseconds(500))
+        return 0;
+    told = now;
+    bool stop = false;
+    if (int err = stopRequested(task.record.uuid, stop))
+        return err;
+    if (stop)
+        return fail(STOPPED, "the sending was stopped");
+    // Until the peer has made the state its own, one byte is left.
+    task.progress.sent_size = std::min(moved_before + moved, total - 1);
+    task.progress.send_total_size = total;
+    task.progress.progress_value = task.progress.sent_size * 100 / total;
+    return updateProgress(task.progress);
+}
+
+/// A discovery log-in: whoever answers it is a portal.
+int checkPortal(const std::string &portal)
+{
+    const std::unique_ptr<iscsi_context, decltype(&iscsi_destroy_context)> context(
+        iscsi_create_context("iqn.2001-01.norv:check"), iscsi_destroy_context);
+    if (!context)
+        return fail(NORV_ERR_OUT_OF_MEMORY, "no memory for a connection");
+    iscsi_set_session_type(context.get(), ISCSI_SESSION_DISCOVERY);
+    iscsi_set_noautoreconnect(context.get(), 1);
+    iscsi_set_timeout(context.get(), 10);
+    if (iscsi_connect_sync(context.get(), portal.c_str()) != 0 || iscsi_login_sync(context.get()) != 0)
+        return fail(-ECONNREFUSED, "no iSCSI portal answers at %s: %s", portal.c_str(), iscsi_get_error(context.get()));
+    iscsi_disconnect(context.get());
+    return 0;
+}
+
+/// Whether it is the key of a paired appliance.
+int checkRodKey(const std::string &rod_key)
+{
+    std::vector<NorvDRNode::DRNode> nodes;
+    if (!NorvDRNode::DRNodeDB::List(nodes, NorvDRNode::CRED_REMOTE))
+        return NORV_ERR_GET_CONFIG;
+    for (const NorvDRNode::DRNode &node : nodes) {
+        PairedNode paired;
+        if (iscsihost::describePairedNode(node.id, paired) == 0 && sameBytes(paired.rod_key, rod_key))
+            return 0;
+    }
+    return fail(NORV_ERR_ROD_KEY, "the ROD key is no paired appliance's");
+}
+
+} // namespace
+
+bool isSending(const char *task_uuid)
+{
+    NamedLock lock;
+    return lock.tryTake(lockName(task_uuid)) == 0 && !lock.held();
+}
+
+int stopSending(const TaskRow &task)
+{
+    if (!isSending(task.record.uuid))
+        return 0;
+    if (int err = requestStop(task.record.uuid, true))
+        return err;
+    const auto limit = Clock::now() + std::chrono::seconds(10);
+    while (isSending(task.record.uuid)) {
+        if (Clock::now() > limit)
+            return fail(NORV_ERR_TIMEOUT, "the sender of the task %s does not stop", task.record.uuid);
+        std::this_thread::sleep_for(std::chrono::milliseconds(100));
+    }
+    return 0;
+}
+
+int readProgress(const TaskRow &task, _tag_iscsi_task_progress_ &progress)
+{
+    // A sender stores its end before it lets go of its lock, and takes the lock before it stores its beginning.
+    for (TaskRow row = task;;) {
+        if (row.progress.error == RUNNING && !isSending(row.record.uuid)) {
+            if (int err = loadTask(row.record.uuid, row))
+                return err;
+            if (row.progress.error == RUNNING && isSending(row.record.uuid))
+                continue;
+            if (row.progress.error == RUNNING)
+                row.progress.error = KILLED;
+        }
+        progress = row.progress;
+        if (progress.error == RUNNING)
+            progress.error = 0;
+        return 0;
+    }
+}
+
+} // namespace norvhost
+
+using namespace norvhost;
+
+int NORViSCSIReplicationTaskSendSnapshot(const _tag_iscsi_task_ *task, const char *address, const char *rod_key,
+                                         const char *snapshot_uuid, const char *base_version, unsigned int port,
+                                         bool full_sync, bool encrypted, bool /*last_try*/)
+{
+    if (!task || !snapshot_uuid || !rod_key)
+        return fail(NORV_ERR_NULL_POINTER, "a task, a ROD key and a snapshot are needed");
+    Sender sender;
+    sender.rod_key = rod_key;
+    if (encrypted)
+        return fail(NORV_ERR_BAD_PARAMETER, "sending inside TLS is not possible here");
+    if (port > UINT16_MAX)
+        return fail(NORV_ERR_TASK_ADDRESS, "port: is no port");
+    const std::string host = textOf(address);
+    if (!host.empty() && !isHost(host))
+        return fail(NORV_ERR_TASK_ADDRESS, "address: is no host name and no address");
+    if (!host.empty())
+        sender.portal = authority(host, static_cast<uint16_t>(port ? port : 3261));
+    if (int err = sender.prepare(*task, snapshot_uuid, full_sync ? nullptr : base_version))
+        return err;
+    const int child = NLIBCProcForkChildNoWait();
+    if (child < 0)
+        return NORV_ERR_FORK;
+    if (child > 0)
+        return sender.leaveToChild(), 0;
+    sender.run();
+    _exit(0);
+}
+
+int NORViSCSIReplicationTaskStopSendingSnapshot(const _tag_iscsi_task_ *task)
+{
+    if (!task)
+        return fail(NORV_ERR_NULL_POINTER, "no task record");
+    if (!isSending(task->uuid))
+        return fail(NORV_ERR_TASK_NOT_RUNNING, "the task %s is not sending", task->uuid);
+    return requestStop(task->uuid, true);
+}
+
+int NORViSCSIReplicationTaskCheckConnection(const char *address, unsigned int port, const char *rod_key)
+{
+    if (!address || !rod_key || !*rod_key)
+        return fail(NORV_ERR_NULL_POINTER, "an address and a ROD key are needed");
+    if (!isHost(address) || port > UINT16_MAX)
+        return fail(NORV_ERR_TASK_ADDRESS, "address: is no host name or address with a port");
+    if (int err = checkRodKey(rod_key))
+        return err;
+    return checkPortal(authority(address, static_cast<uint16_t>(port ? port : 3260)));
+}
