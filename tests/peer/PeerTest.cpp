@@ -5,6 +5,7 @@
 
 #include <cstdio>
 #include <cstdlib>
+#include <fcntl.h>
 #include <filesystem>
 #include <stdexcept>
 #include <sys/wait.h>
@@ -25,14 +26,12 @@ public:
     Server() : folder(makeFolder())
     {
         int in[2], out[2];
-        if (pipe(in) != 0 || pipe(out) != 0)
+        if (pipe2(in, O_CLOEXEC) != 0 || pipe2(out, O_CLOEXEC) != 0)
             throw std::runtime_error("no pipes for the server");
         process = fork();
         if (process == 0) {
             dup2(in[0], STDIN_FILENO);
             dup2(out[1], STDOUT_FILENO);
-            for (int fd : {in[0], in[1], out[0], out[1]})
-                close(fd);
             execl(PYTHON, PYTHON, "-B", BAD_SERVER, folder.c_str(), nullptr);
             _exit(127);
         }
