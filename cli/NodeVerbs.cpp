@@ -217,6 +217,18 @@ void addLogout(Commands &commands, CLI::App &noun)
     addSelector(verb, *a);
 }
 
+void addCheck(Commands &commands, CLI::App &noun)
+{
+    auto a = std::make_shared<Arguments>();
+    CLI::App &verb = addVerb(commands, noun, "check", "Tell whether a node can be reached to replicate to it", [a] {
+        request(Method::Post, nodePath(a->selector, "/check"), a->input);
+        print(shown(a->input["address"].asString()) + " can be reached\n");
+    });
+    addSelector(verb, *a);
+    addText(verb, "--address", "ADDRESS", a->input, "address", "Data address of the node").required();
+    addNumber(verb, "--port", a->input, "port", "Port of the data address (the one that the node gives)");
+}
+
 } // namespace
 
 void addNodeVerbs(Commands &commands)
@@ -225,6 +237,7 @@ void addNodeVerbs(Commands &commands)
     addList(commands, noun);
     addShow(commands, noun);
     addStatus(commands, noun);
+    addCheck(commands, noun);
     addJoin(commands, noun);
     addRemove(commands, noun);
     addTrust(commands, noun);
