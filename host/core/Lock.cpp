@@ -264,6 +264,12 @@ int waitForSnapshotLock(int lid, int snap_id, int limit)
     return waitForLock(snapshotLockPath(lid, snap_id), limit);
 }
 
+int namedLockHeld(const std::string &name, bool &held)
+{
+    FileDescriptor file;
+    return askLock(lockFolder() + "/" + name, O_RDONLY, file, held);
+}
+
 int NamedLock::take(const std::string &name)
 {
     return lockNamed(name, F_OFD_SETLKW, file);

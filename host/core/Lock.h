@@ -91,9 +91,14 @@ public:
     int tryTake(const std::string &name);
 
     bool held() const { return static_cast<bool>(file); }
+    /// Lets go of it; after a fork() it stays the child's.
+    void leaveToChild() { file.reset(); }
 
 private:
     FileDescriptor file;
 };
+
+/// Whether the lock of that name is held now, by whichever process.
+int namedLockHeld(const std::string &name, bool &held);
 
 } // namespace norvhost

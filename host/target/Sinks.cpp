@@ -247,6 +247,12 @@ int loadSinkLun(int tid, MappedLun &lun)
     return 0;
 }
 
+int dropSink(const std::string &lun_uuid)
+{
+    const int err = iscsihost::closeSink(lun_uuid, "", false);
+    return err == NORV_ERR_NO_SUCH_TARGET ? 0 : err;
+}
+
 int closeAbandonedSinks()
 {
     std::vector<OpenSink> sinks;

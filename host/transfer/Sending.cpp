@@ -39,6 +39,9 @@ constexpr auto login_limit = 15s, stall_limit = 60s, flush_limit = 600s, logout_
 constexpr auto progress_interval = 100ms;
 constexpr int keepalive_seconds = 10, keepalive_count = 3;
 
+/// What is written between two flushes, which make the unit's disk work along: the last one has little to wait for.
+constexpr uint64_t flush_step = 64 << 20;
+
 /// Commands that are begun before the connection is served again.
 constexpr int issues_at_once = 8;
 constexpr size_t planned_max = 8192;
@@ -112,6 +115,8 @@ private:
         Sender *sender;
         unsigned char *buffer;
         Piece piece;
+        bool flushes = false;
+        bool under_way = false;
     };
 
     int logIn();
@@ -121,6 +126,8 @@ private:
     int issue();
     int write(const Piece &piece);
     int unmapGathered();
+    int beginFlush();
+    uint64_t lowestOpenPlace() const;
     int began(Request *request, const scsi_task *task);
     int flush();
     void logOut();
@@ -149,6 +156,8 @@ private:
     Piece gathered; ///< adjoining zeros, to be unmapped
 
     uint64_t moved = 0, capacity = 0;
+    uint64_t written = 0; ///< since the latest flush began
+    bool flushing = false;
     Clock::time_point last_movement, last_told;
     bool answer_came = false, ending = false;
     int answer_status = 0, failure = 0;
@@ -238,6 +247,9 @@ int Sender::stream()
             return 0;
         // In small portions: the connection is to be served meanwhile. Zeros may need a request of their own.
         bool busy = false;
+        if (!flushing && written >= flush_step && idle.size() >= 2)
+            if (int err = beginFlush())
+                return err;
         for (int i = 0; i < issues_at_once && idle.size() >= 2 && !(planned.empty() && gathered.length == 0); ++i) {
             if (int err = issue())
                 return err;
@@ -256,9 +268,13 @@ int Sender::plan()
         if (rest.length == 0) {
             if (source_ended)
                 return 0;
-            if (int err = sending.next(rest))
+            DataRange range;
+            if (int err = sending.next(range))
                 return err;
-            source_ended = rest.length == 0;
+            source_ended = range.length == 0;
+            if (source_ended)
+                return 0;
+            rest = range;
             if (rest.offset % block_size || rest.length % block_size || rest.offset + rest.length > capacity)
                 return fail(-ENXIO, "the unit %d of %s has %llu bytes: it is too small", sending.to.lun,
                             sending.to.target.c_str(), static_cast<unsigned long long>(capacity));
@@ -334,6 +350,9 @@ Sender::Request *Sender::takeRequest(const Piece &piece)
     Request *const request = idle.back();
     idle.pop_back();
     request->piece = piece;
+    request->flushes = false;
+    request->under_way = true;
+    written += piece.data;
     return request;
 }
 
@@ -341,8 +360,32 @@ int Sender::began(Request *request, const scsi_task *task)
 {
     if (task)
         return 0;
+    request->under_way = false;
     idle.push_back(request);
     return fail(-ENOMEM, "cannot begin an iSCSI command: %s", iscsi_get_error(session.get()));
+}
+
+/// Below it everything was acknowledged.
+uint64_t Sender::lowestOpenPlace() const
+{
+    uint64_t lowest = planned.empty() ? rest.offset : planned.front().offset;
+    if (gathered.length > 0)
+        lowest = std::min(lowest, gathered.offset);
+    for (const Request &request : requests)
+        if (request.under_way)
+            lowest = std::min(lowest, request.piece.offset);
+    return lowest;
+}
+
+int Sender::beginFlush()
+{
+    Piece place;
+    place.offset = lowestOpenPlace();
+    Request *const request = takeRequest(place);
+    request->flushes = true;
+    flushing = true;
+    written = 0;
+    return began(request, iscsi_synchronizecache16_task(session.get(), sending.to.lun, 0, 0, 0, 0, ended, request));
 }
 
 int Sender::flush()
@@ -421,13 +464,19 @@ void Sender::ended(iscsi_context *iscsi, int status, void *data, void *request)
     Sender &self = *mine.sender;
     const std::unique_ptr<scsi_task, FreeTask> task(static_cast<scsi_task *>(data));
     self.idle.push_back(&mine);
+    mine.under_way = false;
     self.last_movement = Clock::now();
-    if (status == SCSI_STATUS_GOOD)
+    if (mine.flushes)
+        self.flushing = false;
+    if (status == SCSI_STATUS_GOOD) {
         self.moved += mine.piece.data;
-    else if (!self.ending && !self.failure)
+        if (mine.flushes && self.sending.flushed)
+            self.sending.flushed(mine.piece.offset);
+    } else if (!self.ending && !self.failure) {
         self.failure =
             fail(-meaning(status, task.get()), "%s failed a write at %llu: %s", self.sending.to.target.c_str(),
                  static_cast<unsigned long long>(mine.piece.offset), iscsi_get_error(iscsi));
+    }
 }
 
 } // namespace

@@ -28,10 +28,12 @@ struct Sending {
     /// Hears the bytes of data that the unit has acknowledged or needs not to be told, ten times a second also when
     /// nothing moves. A code other than 0 stops the sending and is its result.
     std::function<int(uint64_t moved)> progress;
+    /// Hears from time to time up to which place the unit has it all, flushed; may be empty.
+    std::function<void(uint64_t place)> flushed;
 };
 
 /// Sends it all and flushes the unit. One connection, which is not made again: whoever wants to go on after a failure
-/// begins anew with the ranges that are left. Takes 16 MiB of memory, whatever the size. The calling thread does
+/// begins anew with the ranges that are left, from where it was flushed to. Takes 16 MiB of memory, whatever the size. The calling thread does
 /// everything; a process may fork before and after.
 ///
 /// 0, the code of `next` or `progress`, or a negative errno value with its reason recorded:

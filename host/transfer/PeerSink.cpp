@@ -1,0 +1,130 @@
+#include "host/transfer/PeerSink.h"
+
+#include "host/core/LastError.h"
+#include "host/target/Sinks.h"
+#include "iscsihost/https.h"
+#include "iscsihost/node.h"
+#include "platform/dr_node.h"
+#include "platform/error.h"
+#include "platform/extent_pool.h"
+
+#include <algorithm>
+#include <json/value.h>
+#include <json/writer.h>
+
+namespace norvhost {
+namespace {
+
+using iscsihost::HttpsRequest;
+using iscsihost::PairedNode;
+using iscsihost::Sink;
+
+/// A request about a sink of the node, "open" or "close".
+int ask(const PairedNode &node, const std::string &lun_uuid, const char *what, const Json::Value &input,
+        Json::Value &answer)
+{
+    HttpsRequest request;
+    request.host = node.host;
+    request.port = node.port;
+    request.protocol = node.protocol;
+    request.method = "POST";
+    request.path = "/api/v1/sinks/" + lun_uuid + "/" + what;
+    request.token = node.token;
+    request.pin = node.pin;
+    Json::StreamWriterBuilder compact;
+    compact["indentation"] = "";
+    request.body = Json::writeString(compact, input);
+    return iscsihost::callApi(request, answer);
+}
+
+/// The node is another appliance: what it answers is looked at before it is used.
+bool readSink(const Json::Value &answer, Sink &sink)
+{
+    if (!answer.isObject() || !answer["portal"].isString() || !answer["iqn"].isString() || !answer["lun"].isInt() ||
+        !answer["size"].isUInt64() || !answer["is_blank"].isBool())
+        return false;
+    sink.portal = answer["portal"].asString();
+    sink.iqn = answer["iqn"].asString();
+    sink.lun = answer["lun"].asInt();
+    sink.size = answer["size"].asUInt64();
+    sink.blank = answer["is_blank"].asBool();
+    return sink.iqn.compare(0, 4, "iqn.") == 0 && sink.lun >= 0;
+}
+
+/// "[::1]" of "::1"; names and IPv4 addresses as they are.
+std::string bracketed(const std::string &host)
+{
+    const bool bare_ipv6 = host[0] != '[' && std::count(host.begin(), host.end(), ':') > 1;
+    return bare_ipv6 ? "[" + host + "]" : host;
+}
+
+int openLocally(const std::string &lun_uuid, Sink &sink, std::string &host, std::string &rod_key)
+{
+    char key[256] = {};
+    if (int err = NORVExtentPoolRODKeyGet(key, sizeof key))
+        return err;
+    rod_key = key;
+    host = "127.0.0.1";
+    return iscsihost::openSink(lun_uuid, sink);
+}
+
+int openRemotely(const std::string &node_uuid, const std::string &lun_uuid, Sink &sink, std::string &host,
+                 std::string &rod_key)
+{
+    PairedNode node;
+    Json::Value answer;
+    if (int err = iscsihost::describePairedNode(node_uuid, node))
+        return err;
+    if (int err = ask(node, lun_uuid, "open", Json::Value(Json::objectValue), answer))
+        return err;
+    if (!readSink(answer, sink))
+        return fail(NORV_ERR_BAD_RESPONSE, "%s does not say where its sink is", node.host.c_str());
+    host = node.host;
+    rod_key = node.rod_key;
+    return 0;
+}
+
+} // namespace
+
+int openPeerSink(const std::string &node_uuid, const std::string &lun_uuid, const std::string &portal, PeerSink &sink)
+{
+    PeerSink opened;
+    opened.node = node_uuid;
+    opened.lun = lun_uuid;
+    std::string host, rod_key;
+    const bool local = NorvDRNode::DRNode::isLocalNodeId(node_uuid);
+    if (int err = local ? openLocally(lun_uuid, opened.sink, host, rod_key)
+                        : openRemotely(node_uuid, lun_uuid, opened.sink, host, rod_key))
+        return err;
+    IscsiUnit &unit = opened.unit;
+    unit.portal = opened.sink.portal;
+    if (unit.portal.empty() || unit.portal[0] == ':') // it listens everywhere: where we reached it
+        unit.portal = bracketed(host) + unit.portal;
+    if (!portal.empty())
+        unit.portal = bracketed(portal);
+    unit.target = opened.sink.iqn;
+    unit.lun = opened.sink.lun;
+    const SinkLogIn log_in = sinkLogIn(rod_key, lun_uuid);
+    unit.initiator = log_in.initiator;
+    unit.user = log_in.user;
+    unit.secret = log_in.secret;
+    unit.mutual_user = log_in.mutual_user;
+    unit.mutual_secret = log_in.mutual_secret;
+    sink = opened;
+    return 0;
+}
+
+int closePeerSink(const std::string &node_uuid, const std::string &lun_uuid, const std::string &sink_iqn, bool complete)
+{
+    if (NorvDRNode::DRNode::isLocalNodeId(node_uuid))
+        return iscsihost::closeSink(lun_uuid, sink_iqn, complete);
+    PairedNode node;
+    Json::Value input, answer;
+    input["iqn"] = sink_iqn;
+    input["complete"] = complete;
+    if (int err = iscsihost::describePairedNode(node_uuid, node))
+        return err;
+    return ask(node, lun_uuid, "close", input, answer);
+}
+
+} // namespace norvhost

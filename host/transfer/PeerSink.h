@@ -1,0 +1,28 @@
+/// Sinks of other appliances, and of this one.
+#pragma once
+
+#include "host/transfer/Sending.h"
+#include "iscsihost/sink.h"
+
+#include <string>
+
+namespace norvhost {
+
+/// A sink that a node has opened for us.
+struct PeerSink {
+    std::string node; ///< UUID
+    std::string lun;  ///< UUID
+    iscsihost::Sink sink;
+    IscsiUnit unit; ///< how to get there
+};
+
+// Each returns 0, a code of this appliance (NORV_ERR_NO_SUCH_NODE, those of iscsihost/https.h) or the node's own.
+
+/// `portal` ("host", "host:port", an address with or without brackets; without a port that of iSCSI) is used in place
+/// of what the node answers, unless it is empty.
+int openPeerSink(const std::string &node_uuid, const std::string &lun_uuid, const std::string &portal, PeerSink &sink);
+
+int closePeerSink(const std::string &node_uuid, const std::string &lun_uuid, const std::string &sink_iqn,
+                  bool complete);
+
+} // namespace norvhost
