@@ -1,18 +1,12 @@
 #include "WebVerbs.h"
 
 #include "iscsihost/web.h"
+#include "Output.h"
 
 #include <cstdio>
 #include <memory>
 
 namespace {
-
-int check(const char *what, int code)
-{
-    if (code)
-        fprintf(stderr, "iscsi-host: %s failed: error %d: %s\n", what, code, iscsi_host_last_error());
-    return code ? 1 : 0;
-}
 
 int setListener(const iscsihost::WebListener &wish)
 {
