@@ -10,7 +10,7 @@
 #include "host/storage/SnapshotFiles.h"
 #include "host/storage/SnapshotStore.h"
 #include "host/target/Sinks.h"
-#include "host/transfer/Sending.h"
+#include "host/transfer/PeerSink.h"
 #include "iscsihost/https.h"
 #include "iscsihost/node.h"
 #include "platform/core.h"
@@ -71,61 +71,43 @@ public:
         return iscsihost::callApi(request, answer);
     }
 
-    const std::string &host() const { return node.host; }
-
 private:
     PairedNode node;
 };
 
 /// The peer's sink, open until the object ends.
-class PeerSink {
+class OpenSink {
 public:
-    PeerSink(const PeerApi &api, const char *lun_uuid) : api(api), path(std::string("/sinks/") + lun_uuid) {}
-    PeerSink(const PeerSink &) = delete;
-    ~PeerSink() { close(false); }
+    OpenSink() = default;
+    OpenSink(const OpenSink &) = delete;
+    ~OpenSink() { close(false); }
 
-    int open(const std::string &rod_key, const std::string &lun_uuid, const std::string &portal)
+    /// The log-in is made with the key that the caller has, not with the one that is stored with the node.
+    int open(const TaskRow &task, const std::string &rod_key, const std::string &portal)
     {
-        Json::Value answer;
-        if (int err = api.call("POST", path + "/open", Json::objectValue, answer))
+        const std::string lun_uuid = task.record.dst_lun_uuid;
+        if (int err = openPeerSink(task.remoteNode(), lun_uuid, portal, sink))
             return err;
-        const Json::Value &number = answer["lun"];
-        if (!answer["portal"].isString() || !answer["iqn"].isString() || !number.isInt())
-            return fail(NORV_ERR_BAD_RESPONSE, "the peer opens its sink without saying where");
-        iqn = answer["iqn"].asString();
+        is_open = true;
         const SinkLogIn log_in = sinkLogIn(rod_key, lun_uuid);
-        unit.portal = portal.empty() ? answer["portal"].asString() : portal;
-        if (unit.portal.rfind(':', 0) == 0) // it listens on all its addresses
-            unit.portal =
-                (api.host().find(':') == std::string::npos ? api.host() : "[" + api.host() + "]") + unit.portal;
-        unit.target = iqn;
-        unit.lun = number.asInt();
-        unit.initiator = log_in.initiator;
-        unit.user = log_in.user;
-        unit.secret = log_in.secret;
-        unit.mutual_user = log_in.mutual_user;
-        unit.mutual_secret = log_in.mutual_secret;
+        sink.unit.secret = log_in.secret;
+        sink.unit.mutual_secret = log_in.mutual_secret;
         return 0;
     }
 
     int close(bool complete)
     {
-        if (iqn.empty())
+        if (!is_open)
             return 0;
-        Json::Value body(Json::objectValue), answer;
-        body["iqn"] = iqn;
-        body["complete"] = complete;
-        iqn.clear();
-        return api.call("POST", path + "/close", body, answer);
+        is_open = false;
+        return closePeerSink(sink.node, sink.lun, sink.sink.iqn, complete);
     }
 
-    const IscsiUnit &where() const { return unit; }
+    const IscsiUnit &unit() const { return sink.unit; }
 
 private:
-    const PeerApi &api;
-    std::string path;
-    std::string iqn;
-    IscsiUnit unit;
+    PeerSink sink;
+    bool is_open = false;
 };
 
 /// One sending: prepared in the caller's process, carried out in a worker.
@@ -146,7 +128,7 @@ public:
 private:
     int send();
     int describe(const Json::Value &reception);
-    int sendRanges(const PeerSink &sink);
+    int sendAll(const OpenSink &sink);
     int note(uint64_t offset);
     int tell(uint64_t moved);
     std::string arrivalPath() const { return std::string("/replications/") + task.record.uuid + "/arrival"; }
@@ -234,10 +216,10 @@ int Sender::send()
         return err;
     if (int err = describe(reception))
         return err;
-    PeerSink sink(api, task.record.dst_lun_uuid);
-    if (int err = sink.open(rod_key, task.record.dst_lun_uuid, portal))
+    OpenSink sink;
+    if (int err = sink.open(task, rod_key, portal))
         return err;
-    if (int err = sendRanges(sink))
+    if (int err = sendAll(sink))
         return err;
     if (int err = sink.close(true))
         return err;
@@ -270,7 +252,7 @@ int Sender::describe(const Json::Value &reception)
     return tell(0);
 }
 
-int Sender::sendRanges(const PeerSink &sink)
+int Sender::sendAll(const OpenSink &sink)
 {
     size_t at = 0;
     while (at < ranges.size() && ranges[at].offset + ranges[at].length <= offset)
@@ -278,7 +260,7 @@ int Sender::sendRanges(const PeerSink &sink)
     while (at < ranges.size()) {
         uint64_t budget = FLUSH_INTERVAL;
         norvhost::Sending sending;
-        sending.to = sink.where();
+        sending.to = sink.unit();
         sending.from = file.get();
         sending.to_zeros = to_zeros;
         sending.progress = [&](uint64_t moved) { return tell(moved); };
@@ -299,7 +281,7 @@ int Sender::sendRanges(const PeerSink &sink)
                 ++at;
             return 0;
         };
-        if (int err = norvhost::sendRanges(sending))
+        if (int err = sendRanges(sending))
             return err;
         moved_before += FLUSH_INTERVAL - budget;
         if (int err = note(offset))
