@@ -111,6 +111,10 @@ Result deleteVlun(const Request &request);
 Result remoteCloneLun(const Request &request);
 Result showRemoteClone(const Request &request);
 
+// What a peer that streams a LUN asks for.
+Result openSink(const Request &request);
+Result closeSink(const Request &request);
+
 /// Bytes that have arrived of a copy that is under way, else 0.
 Json::UInt64 syncProgress(unsigned long long done, unsigned long long total);
 

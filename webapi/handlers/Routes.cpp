@@ -207,6 +207,11 @@ constexpr Field VLUN_BIND[] = {
     {"portals", Type::List, OPTIONAL, 1, MAX_PORTALS, ERR_BAD_PORTALS, nullptr, PORTAL_ELEMENT},
 };
 
+constexpr Field SINK_CLOSE[] = {
+    {"iqn", Type::Text, OPTIONAL, 1, IQN_MAX_BYTES, ERR_BAD_TARGET_IQN},
+    {"complete", Type::Boolean, REQUIRED, 0, 0, 0},
+};
+
 constexpr Field REMOTE_CLONE[] = {
     {"node", Type::Text, REQUIRED, 1, HOST_MAX_BYTES, ERR_BAD_NODE_UUID},
     {"name", Type::Text, OPTIONAL, 1, NAME_MAX_BYTES, ERR_BAD_LUN_NAME},
@@ -370,6 +375,8 @@ const std::vector<Route> &routes()
         {Method::Get, "/vluns/{uuid}", Role::Viewer, NONE, showVlun},
         {Method::Delete, "/vluns/{uuid}", Role::Admin, NONE, deleteVlun},
         {Method::Post, "/vluns/{uuid}/bind", Role::Admin, VLUN_BIND, bindVlun},
+        {Method::Post, "/sinks/{lun}/open", Role::Admin, NONE, openSink},
+        {Method::Post, "/sinks/{lun}/close", Role::Admin, SINK_CLOSE, closeSink},
     };
     return table;
 }

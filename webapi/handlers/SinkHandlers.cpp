@@ -1,0 +1,37 @@
+// Sink LUNs, which a peer has opened before it streams to them.
+#include "webapi/handlers/Handlers.h"
+
+#include "iscsihost/sink.h"
+
+namespace webapi {
+
+/// The log-in is in no answer: both sides derive it.
+Result openSink(const Request &request)
+{
+    std::string lun_uuid;
+    if (Result bad = selectLun(request.path.at("lun"), lun_uuid); bad.code)
+        return bad;
+    iscsihost::Sink sink;
+    if (int err = iscsihost::openSink(lun_uuid, sink))
+        return failed(err);
+    Result result;
+    result.value["portal"] = sink.portal;
+    result.value["iqn"] = sink.iqn;
+    result.value["lun"] = sink.lun;
+    result.value["size"] = static_cast<Json::UInt64>(sink.size);
+    result.value["is_blank"] = sink.blank;
+    return result;
+}
+
+Result closeSink(const Request &request)
+{
+    std::string lun_uuid;
+    if (Result bad = selectLun(request.path.at("lun"), lun_uuid); bad.code)
+        return bad;
+    const Json::Value &in = request.input;
+    if (int err = iscsihost::closeSink(lun_uuid, in["iqn"].asString(), in["complete"].asBool()))
+        return failed(err);
+    return {};
+}
+
+} // namespace webapi
