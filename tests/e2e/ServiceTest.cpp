@@ -7,6 +7,7 @@
 #include "host/target/Wait.h"
 #include "iscsihost/host.h"
 #include "platform/error.h"
+#include "platform/system.h"
 
 #include <arpa/inet.h>
 #include <csignal>
@@ -89,6 +90,25 @@ TEST_F(ServiceTest, WithoutDaemonsACommandFailsClearlyAndChangesNothing)
     Initiator reader(bob);
     ASSERT_TRUE(reader.logIn(store.target.iqn));
     EXPECT_EQ(reader.capacity(), 32 * MiB);
+}
+
+TEST_F(ServiceTest, WhatRunsAnswersForTheAppliancesModules)
+{
+    std::string node;
+    ASSERT_EQ(iscsihost::init(node), 0);
+    const auto up = [] {
+        std::string names;
+        for (const char *name : {"iscsi_target_mod", "target_core_mod", "iscsi_extent_pool", "iscsi_rodsp", "configfs"})
+            if (NORVCheckModule(name) == 1)
+                names += std::string(name) + " ";
+        return names;
+    };
+    EXPECT_EQ(up(), "iscsi_target_mod target_core_mod iscsi_extent_pool iscsi_rodsp configfs ");
+    EXPECT_EQ(NORVSystemGetBootStep(), NORV_BOOT_DONE);
+    killProcess(portalProcess());
+    EXPECT_EQ(up(), "target_core_mod iscsi_extent_pool iscsi_rodsp configfs ");
+    killProcess(ro.processId());
+    EXPECT_EQ(up(), "iscsi_extent_pool iscsi_rodsp ");
 }
 
 TEST_F(ServiceTest, ATakenPortIsFoundOut)

@@ -55,6 +55,6 @@ bool exists(const std::string &path);
 void setName(_tag_iscsi_lun_ &lun, const std::string &name);
 
 /// Fails the test that needs root instead of skipping it.
-#define NEED_ROOT() ASSERT_EQ(0u, geteuid()) << "this test mounts loop devices: run it as root"
+#define NEED_ROOT() ASSERT_EQ(0u, geteuid()) << "this test mounts loop devices or changes owners: run it as root"
 
 } // namespace norvhost

@@ -2,6 +2,7 @@
 
 #include "host/core/Process.h"
 
+#include <fstream>
 #include <json/json.h>
 
 namespace norvhost {
@@ -47,6 +48,32 @@ TEST_F(ToolTest, ShowsVolumesAndStatusForPrograms)
     EXPECT_EQ("127.0.0.1 ::1", status["portal"].asString());
     ASSERT_EQ(1u, status["unhealthy"].size());
     EXPECT_EQ("gone", status["unhealthy"][0]["name"].asString());
+}
+
+TEST_F(ToolTest, KeepsAccountsAndTakesNoPasswordFromTheCommandLine)
+{
+    const std::string secret = "a good password", file = root + "/password";
+    std::ofstream(file) << secret << "\nanother line\n";
+    const ProgramResult added = run({"account", "add", "alice", "--role", "admin", "--otp", "--password-file", file});
+    EXPECT_EQ(0, added.status) << added.errors;
+    EXPECT_EQ(0u, added.output.find("otpauth://totp/"));
+    EXPECT_EQ(std::string::npos, (added.output + added.errors).find(secret));
+    EXPECT_EQ(0, run({"account", "add", "bob", "--password-file", file}).status);
+    EXPECT_EQ(1, run({"account", "add", "bob", "--password-file", file}).status);
+    EXPECT_EQ(1, run({"account", "add", "carol", "--password-file", root + "/missing"}).status);
+    EXPECT_EQ(2, run({"account", "add", "carol", secret}).status);
+    EXPECT_EQ(2, run({"account", "add", "carol", "--role", "boss", "--password-file", file}).status);
+    EXPECT_EQ(0, run({"account", "passwd", "bob", "--password-file", file}).status);
+
+    const Json::Value accounts = json({"account", "list", "--json"});
+    ASSERT_EQ(2u, accounts.size());
+    EXPECT_EQ("admin", accounts[0]["role"].asString());
+    EXPECT_TRUE(accounts[0]["one_time_codes"].asBool());
+    EXPECT_EQ("viewer", accounts[1]["role"].asString());
+    EXPECT_FALSE(accounts[1]["one_time_codes"].asBool());
+    EXPECT_EQ(0u, json({"session", "list", "--json"}).size());
+    EXPECT_EQ(0, run({"account", "remove", "bob"}).status);
+    EXPECT_EQ(1, run({"account", "remove", "bob"}).status);
 }
 
 TEST_F(ToolTest, TellsFailureFromWrongUsage)
