@@ -5,8 +5,6 @@
 #include "host/state/Fields.h"
 #include "platform/virtual_lun.h"
 
-#pragma weak NORViSCSIVirtualLunStatsGet // until it is written
-
 namespace norvhost {
 namespace {
 

@@ -193,6 +193,7 @@ void SenderJob::run()
         syslog(LOG_ERR, "the virtual LUN %s stopped sending: %s", row.uuid.c_str(), lastError());
     if (endVirtualLun(row.uuid, stateOf(code), code ? moved : row.total, row.total) != 0)
         syslog(LOG_ERR, "the virtual LUN %s: %s", row.uuid.c_str(), lastError());
+    clone.reset();       // nothing keeps the volume busy once the lock is free
     lock.leaveToChild(); // whoever removes it closes the sink then, or we do
     if (code == 0)
         forgetSink(row.uuid, row.sink_iqn);

@@ -15,6 +15,7 @@
 #include "iscsihost/sink.h"
 #include "platform/error.h"
 #include "platform/extent_pool.h"
+#include "platform/virtual_lun.h"
 
 #include <csignal>
 #include <cstring>
@@ -169,6 +170,203 @@ TEST_F(SinkTest, TakesAllDataAndKeepsHoles)
 
     EXPECT_EQ(iscsihost::closeSink(sink.uuid, again.iqn, true), 0) << iscsi_host_last_error();
     EXPECT_EQ(type(sink), NORV_LUN_TYPE_ADV);
+}
+
+TEST_F(SinkTest, OnlyItsPeerGetsIn)
+{
+    const iscsihost::Sink opened = openSink();
+    const norvhost::SinkLogIn log_in = logIn();
+    const Chap right = {log_in.user, log_in.secret, log_in.mutual_user, log_in.mutual_secret};
+    const auto enters = [&](const std::string &name, const Chap &chap, int port) {
+        Initiator initiator(name);
+        iscsi_set_noautoreconnect(initiator.get(), 1);
+        if (!chap.user.empty())
+            initiator.setChap(chap);
+        return initiator.logIn(opened.iqn, port) && initiator.capacity(opened.lun) == sink.size;
+    };
+    Chap wrong_secret = right, wrong_target = right;
+    wrong_secret.secret.back() ^= 1;
+    wrong_target.mutual_secret.back() ^= 1;
+    for (int port : {portal_port, rw_port}) {
+        EXPECT_TRUE(enters(log_in.initiator, right, port)) << port;
+        EXPECT_FALSE(enters(log_in.initiator, {}, port)) << port;
+        EXPECT_FALSE(enters(log_in.initiator, wrong_secret, port)) << port;
+        EXPECT_FALSE(enters(log_in.initiator, wrong_target, port)) << "it proves who it is, " << port;
+        EXPECT_FALSE(enters(alice, right, port)) << port;
+    }
+    EXPECT_TRUE(Initiator(alice).discover().empty());
+    EXPECT_TRUE(Initiator(log_in.initiator).discover().empty());
+
+    IscsiUnit refused = unit(opened);
+    refused.secret = wrong_secret.secret;
+    EXPECT_EQ(send(refused, true), -EACCES) << iscsi_host_last_error();
+    EXPECT_EQ(std::string(iscsi_host_last_error()).find(right.secret), std::string::npos);
+    refused = unit(opened);
+    refused.portal = "127.0.0.1:9";
+    EXPECT_EQ(send(refused, true), -ECONNREFUSED) << iscsi_host_last_error();
+
+    EXPECT_EQ(NORViSCSILunDelete(&sink), NORV_ERR_LUN_LOCKED);
+    EXPECT_EQ(iscsihost::closeSink(sink.uuid, opened.iqn, false), 0) << iscsi_host_last_error();
+    EXPECT_EQ(type(sink), NORV_LUN_TYPE_SINK);
+    EXPECT_FALSE(enters(log_in.initiator, right, rw_port)) << "closed";
+    EXPECT_EQ(iscsihost::closeSink(sink.uuid, opened.iqn, true), NORV_ERR_NO_SUCH_TARGET);
+    iscsihost::Sink none;
+    EXPECT_EQ(iscsihost::openSink(source.uuid, none), NORV_ERR_LUN_TYPE);
+    EXPECT_EQ(NORViSCSILunDelete(&sink), 0) << iscsi_host_last_error();
+}
+
+TEST_F(SinkTest, OpenedAnewShutsOutWhoeverWasThereBefore)
+{
+    put(source, 0, randomText(64 * MiB, 1));
+    const iscsihost::Sink first = openSink();
+    iscsihost::Sink second;
+    const int err = send(unit(first), true, [&](uint64_t moved) {
+        if (moved > 0 && second.iqn.empty())
+            second = openSink();
+        return 0;
+    });
+    EXPECT_TRUE(second.iqn.empty() ? err == 0 : err < 0) << "it was over too soon, or it went on";
+    second = openSink();
+    EXPECT_EQ(send(unit(first), true), -EACCES);
+    EXPECT_EQ(iscsihost::closeSink(sink.uuid, first.iqn, true), NORV_ERR_NO_SUCH_TARGET);
+    EXPECT_EQ(send(unit(second), second.blank), 0) << iscsi_host_last_error();
+    EXPECT_EQ(contents(sink), contents(source));
+}
+
+TEST_F(SinkTest, BecomesWritableUnderItsReaders)
+{
+    const _tag_iscsi_target_ target = createTarget("readers");
+    map(sink, {target.tid});
+    setDefault(target, NORV_AUTHORITY_READ_WRITE);
+    Initiator initiator(alice);
+    ASSERT_TRUE(initiator.logIn(target.iqn));
+    put(source, 0, std::string(4096, 'x'));
+    const iscsihost::Sink opened = openSink();
+    ASSERT_EQ(send(unit(opened), opened.blank), 0) << iscsi_host_last_error();
+    EXPECT_TRUE(initiator.holds(0, 'x'));
+    EXPECT_FALSE(initiator.write(0, 1));
+    ASSERT_EQ(iscsihost::closeSink(sink.uuid, opened.iqn, true), 0) << iscsi_host_last_error();
+    EXPECT_TRUE(initiator.write(0, 1)) << initiator.error();
+    EXPECT_TRUE(initiator.holds(0, 1));
+}
+
+TEST_F(SinkTest, SurvivesRestartsAndIsClosedWhenNobodyComes)
+{
+    put(source, 0, randomText(4 * MiB, 1));
+    const iscsihost::Sink opened = openSink();
+    killProcess(rw.processId());
+    ASSERT_EQ(norvhost::startService(), 0) << iscsi_host_last_error();
+    EXPECT_EQ(send(unit(opened), opened.blank), 0) << iscsi_host_last_error();
+    EXPECT_EQ(norvhost::closeAbandonedSinks(), 0) << iscsi_host_last_error();
+    EXPECT_EQ(send(unit(opened), opened.blank), 0) << "too early to be closed";
+    norvhost::Query past("UPDATE sinks SET seen = seen - 601");
+    ASSERT_EQ(past.run(), 0);
+    EXPECT_EQ(norvhost::closeAbandonedSinks(), 0) << iscsi_host_last_error();
+    EXPECT_EQ(send(unit(opened), opened.blank), -EACCES) << iscsi_host_last_error();
+    EXPECT_EQ(type(sink), NORV_LUN_TYPE_SINK);
+}
+
+TEST_F(SinkTest, ADaemonKilledUnderASenderEndsIt)
+{
+    put(source, 0, randomText(128 * MiB, 1));
+    const iscsihost::Sink opened = openSink();
+    bool killed = false;
+    EXPECT_EQ(send(unit(opened), opened.blank,
+                   [&](uint64_t moved) {
+                       if (!killed && moved > 0) {
+                           kill(rw.processId(), SIGKILL);
+                           killed = true;
+                       }
+                       return 0;
+                   }),
+              -ECONNRESET)
+        << iscsi_host_last_error();
+    ASSERT_EQ(norvhost::startService(), 0) << iscsi_host_last_error();
+}
+
+class VirtualLunTest : public SinkTest {
+protected:
+    void SetUp() override
+    {
+        SinkTest::SetUp();
+        ASSERT_EQ(norvhost::localNodeId(node), 0);
+        char buffer[37] = {};
+        ASSERT_EQ(NORViSCSIVirtualLunCreate(source.uuid, NORV_VLUN_MODE_SEND, buffer, 0), 0) << iscsi_host_last_error();
+        vlun = buffer;
+    }
+
+    int bind(const std::string &portal = "")
+    {
+        return NORViSCSIVirtualLunBindSink(vlun.c_str(), portal.c_str(), node.c_str(), sink.uuid);
+    }
+
+    _tag_viscsi_virtual_lun_stats_ stats() const
+    {
+        _tag_viscsi_virtual_lun_stats_ now = {};
+        EXPECT_EQ(NORViSCSIVirtualLunStatsGet(vlun.c_str(), &now, 0), 0) << iscsi_host_last_error();
+        EXPECT_LE(now.first, now.second);
+        return now;
+    }
+
+    /// Waits until the transfer has ended.
+    _tag_viscsi_virtual_lun_stats_ wait(std::chrono::milliseconds limit = 60s) const
+    {
+        _tag_viscsi_virtual_lun_stats_ now = {};
+        EXPECT_TRUE(norvhost::waitFor(limit,
+                                      [&] {
+                                          now = stats();
+                                          return now.state != 0 || (now.second != 0 && now.first == now.second);
+                                      }))
+            << now.first << " of " << now.second;
+        return now;
+    }
+
+    std::string node, vlun;
+};
+
+TEST_F(VirtualLunTest, ClonesAndCounts)
+{
+    EXPECT_EQ(stats().second, 0u);
+    put(source, 5 * MiB, randomText(40 * MiB, 1));
+    EXPECT_EQ(NORViSCSILunDelete(&source), NORV_ERR_LUN_LOCKED);
+    ASSERT_EQ(bind(), 0) << iscsi_host_last_error();
+    const _tag_viscsi_virtual_lun_stats_ end = wait();
+    EXPECT_EQ(end.state, 0);
+    EXPECT_GE(end.second, 40 * MiB);
+    EXPECT_LT(end.second, 41 * MiB);
+    EXPECT_EQ(type(sink), NORV_LUN_TYPE_ADV) << "complete means that its sink is an ordinary LUN";
+    EXPECT_EQ(contents(sink), contents(source));
+    _tag_viscsi_virtual_lun_ record = {};
+    EXPECT_EQ(NORViSCSIVirtualLunFillByUUID(vlun.c_str(), &record, 0), 0);
+    EXPECT_EQ(record.src_lid, source.lid);
+    EXPECT_EQ(record.kind, 1);
+    EXPECT_EQ(bind(), NORV_ERR_LUN_TYPE) << "no sink any more";
+    EXPECT_EQ(NORViSCSIVirtualLunRemove(vlun.c_str()), 0) << iscsi_host_last_error();
+    EXPECT_EQ(NORViSCSIVirtualLunRemove(vlun.c_str()), NORV_ERR_VLUN_UUID);
+    EXPECT_EQ(NORViSCSILunDelete(&source), 0) << iscsi_host_last_error();
+}
+
+TEST_F(VirtualLunTest, AnEmptyLunIsClonedToo)
+{
+    ASSERT_EQ(bind("127.0.0.1"), 0) << iscsi_host_last_error();
+    const _tag_viscsi_virtual_lun_stats_ end = wait();
+    EXPECT_EQ(end.state, 0);
+    EXPECT_GT(end.second, 0u);
+    EXPECT_LE(allocated(norvhost::dataPath(sink)), 64u << 10);
+}
+
+TEST_F(VirtualLunTest, RemovalStopsItAtOnceAndLeavesTheSinkClosed)
+{
+    put(source, 0, randomText(200 * MiB, 1));
+    ASSERT_EQ(bind(), 0) << iscsi_host_last_error();
+    EXPECT_EQ(bind(), NORV_ERR_LUN_LOCKED);
+    ASSERT_TRUE(norvhost::waitFor(10s, [&] { return stats().first > 0; }));
+    const auto before = std::chrono::steady_clock::now();
+    EXPECT_EQ(NORViSCSIVirtualLunRemove(vlun.c_str()), 0) << iscsi_host_last_error();
+    EXPECT_LT(std::chrono::steady_clock::now() - before, 3s);
+    EXPECT_EQ(type(sink), NORV_LUN_TYPE_SINK);
+    EXPECT_EQ(iscsihost::closeSink(sink.uuid, "", false), NORV_ERR_NO_SUCH_TARGET) << "it is closed";
+    EXPECT_EQ(NORViSCSILunDelete(&sink), 0) << iscsi_host_last_error();
 }
 
 } // namespace
