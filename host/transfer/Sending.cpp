@@ -138,7 +138,7 @@ private:
     int serve(bool busy, Clock::duration limit);
     int awaitAnswer(Clock::duration limit);
     int tell();
-    int connectionFailed(int errnum);
+    int logInFailed(const std::string &text);
 
     static void connected(iscsi_context *, int status, void *, void *sender);
     static void answered(iscsi_context *, int status, void *task, void *sender);
@@ -161,6 +161,7 @@ private:
     Clock::time_point last_movement, last_told;
     bool answer_came = false, ending = false;
     int answer_status = 0, failure = 0;
+    std::string answer_text;
     std::unique_ptr<iscsi_context, Destroy> session;
 };
 
@@ -204,20 +205,19 @@ int Sender::logIn()
 
     answer_came = false;
     if (iscsi_full_connect_async(iscsi, to.portal.c_str(), to.lun, connected, this) != 0)
-        return connectionFailed(ECONNREFUSED);
+        return logInFailed(iscsi_get_error(iscsi));
     const int err = awaitAnswer(login_limit);
-    if (err == -ECONNRESET || answer_status != SCSI_STATUS_GOOD) {
-        // Which step failed is told by its text only.
-        const bool refused = strstr(iscsi_get_error(iscsi), "log in to target") != nullptr;
-        return err == 0 || err == -ECONNRESET ? connectionFailed(refused ? EACCES : ECONNREFUSED) : err;
-    }
-    return err;
+    if (answer_came && answer_status != SCSI_STATUS_GOOD)
+        return logInFailed(answer_text);
+    return err == -ECONNRESET ? logInFailed(iscsi_get_error(iscsi)) : err;
 }
 
-int Sender::connectionFailed(int errnum)
+/// Which step failed is told by its text only.
+int Sender::logInFailed(const std::string &text)
 {
-    return fail(-errnum, "cannot log in to %s at %s: %s", sending.to.target.c_str(), sending.to.portal.c_str(),
-                iscsi_get_error(session.get()));
+    const bool refused = text.find("log in to target") != text.npos;
+    return fail(refused ? -EACCES : -ECONNREFUSED, "cannot log in to %s at %s: %s", sending.to.target.c_str(),
+                sending.to.portal.c_str(), text.c_str());
 }
 
 int Sender::checkUnit()
@@ -438,11 +438,12 @@ int Sender::serve(bool busy, Clock::duration limit)
     return sending.progress(moved);
 }
 
-void Sender::connected(iscsi_context *, int status, void *, void *sender)
+void Sender::connected(iscsi_context *iscsi, int status, void *, void *sender)
 {
     Sender &self = *static_cast<Sender *>(sender);
     self.answer_came = true;
     self.answer_status = status;
+    self.answer_text = iscsi_get_error(iscsi); // of now: what follows brings texts of its own
 }
 
 void Sender::answered(iscsi_context *, int status, void *data, void *sender)
