@@ -3,6 +3,7 @@
 #include "iscsiwebapi/ISCSIErrorCode.h"
 
 #include <cerrno>
+#include <climits>
 
 namespace webapi {
 namespace {
@@ -61,7 +62,7 @@ constexpr Rule RULES[] = {
 
 int httpStatus(int code)
 {
-    const int positive = code < 0 ? -code : code;
+    const int positive = code < 0 && code != INT_MIN ? -code : code; // errno values come in both signs
     for (const Rule &rule : RULES) {
         if (positive >= rule.first && positive <= rule.last)
             return rule.status;
