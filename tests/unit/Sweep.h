@@ -77,7 +77,7 @@ struct Operation {
     std::function<Outcome()> run;
     std::string untouched; ///< outputs after a failure
     std::vector<Failure> failures;
-    Lines clean_lines = {}; ///< logged without a failure; a failure's lines hold those before it too
+    bool codes_only = false; ///< calls without a line in the table end it with their own code; texts are not compared
 };
 
 template <class... Failures>
@@ -87,11 +87,25 @@ Operation operation(const char *name, void (*set_up)(), std::function<Outcome()>
     return {name, set_up, run, untouched, {failures...}};
 }
 
-inline Operation logging(const Lines &lines, Operation operation)
-{
-    operation.clean_lines = lines;
-    return operation;
-}
+/// What a failing call means to an operation whose log lines need no table of their own.
+enum class Then {
+    STOPS,
+    STOPS_SILENTLY,
+    CLEANS_UP,
+    GOES_ON,
+    ONLY_THE_LOG_TELLS
+};
+
+struct Codes {
+    const char *calls; ///< as Failure::call, several apart by blanks
+    int code;
+    Then then = Then::STOPS;
+};
+
+/// An operation of which the sweep sees to codes, outputs and what is left behind, and that a failure is logged at
+/// all. Calls that are not listed end it with their own code. Empty `untouched`: outputs may change.
+Operation sweptForCodes(const char *name, void (*set_up)(), std::function<Outcome()> run, const std::string &untouched,
+                        const std::vector<Codes> &codes);
 
 class FailureSweep : public LibraryTest, public testing::WithParamInterface<Operation> {};
 

@@ -1,5 +1,5 @@
 #include "iscsiwebapi/ISCSINodeInfo.h"
-#include "tests/unit/Library.h"
+#include "tests/unit/Sweep.h"
 
 namespace unit {
 namespace {
@@ -107,21 +107,6 @@ TEST_F(NodeConfig, AnIncompleteSectionIsNotLoaded)
     EXPECT_EQ(ISCSINodeInfo().loadFromConfig(), 18991100);
     EXPECT_FALSE(ISCSINodeInfo().isInConfig());
     EXPECT_EQ(logged(), Lines{"loadFromConfig: Node UUID is empty"});
-}
-
-TEST_F(NodeConfig, ALockHeldElsewhereIsReported)
-{
-    int fd = -1;
-    ASSERT_EQ(NLIBCFileLockByFile("/tmp/iscsi_node.conf.lock", 1, &fd), 1);
-    ISCSINodeInfo node = peer();
-    std::vector<ISCSINodeInfo> nodes;
-    EXPECT_EQ(node.loadFromConfig(), 18990015);
-    EXPECT_EQ(node.updateConfig(true, true), 18990015);
-    EXPECT_EQ(node.deleteFromNodeConfig(), 18990015);
-    EXPECT_FALSE(node.isInConfig());
-    EXPECT_EQ(ISCSINodeInfo::ListNodeFromConfig(nodes), 18990015);
-    EXPECT_EQ(logged().size(), 5u);
-    EXPECT_TRUE(sections().empty());
 }
 
 class NodeDatabase : public LibraryTest {
@@ -304,6 +289,137 @@ TEST_F(NodeRecord, HasAJSONFormWithoutThePassword)
     EXPECT_EQ(whole.toString() + whole.account,
               "uuid: u ,is_local_node: true ,rod_key: r ,hostname: h ,port: 7 ,protocol: p ,session_id: sa");
 }
+
+// Failing calls.
+
+void configured()
+{
+    addNodes();
+    fake::model().section_files[CONFIG] = {{PEER_NODE,
+                                            {{"hostname", "h"},
+                                             {"port", "1"},
+                                             {"protocol", "https"},
+                                             {"rod_key", "r"},
+                                             {"account", "a"},
+                                             {"session_id", "peer-token"}}}};
+    fake::model().account_ids = {{"u@dir", {9, 10}}};
+    fake::model().cgi_sessions = {"mine"};
+}
+
+void unconfigured()
+{
+    fake::model().section_files[CONFIG] = {};
+}
+
+/// Runs `act` on a peer's record; its host name and session are the outputs.
+Operation onNode(const char *name, void (*set_up)(), int (*act)(ISCSINodeInfo &), const std::string &untouched,
+                 const std::vector<Codes> &codes)
+{
+    const auto run = [act] {
+        ISCSINodeInfo node = peer();
+        const int code = act(node);
+        return Outcome{code, "", node.hostname + " " + node.session_id};
+    };
+    return sweptForCodes(name, set_up, run, untouched, codes);
+}
+
+int listConfig(ISCSINodeInfo &)
+{
+    std::vector<ISCSINodeInfo> nodes;
+    return ISCSINodeInfo::ListNodeFromConfig(nodes);
+}
+
+int select(ISCSINodeInfo &node, const char *selector)
+{
+    return ISCSINodeInfo::GetNodeUUID(selector, node.session_id);
+}
+
+int logOut(ISCSINodeInfo &node)
+{
+    node.logged_in = true;
+    return node.logout();
+}
+
+int openSession(ISCSINodeInfo &node)
+{
+    node.account = "u@dir";
+    return node.createSession();
+}
+
+int closeSession(ISCSINodeInfo &node)
+{
+    node.session_id = "mine";
+    return node.deleteSession();
+}
+
+const char *const KEPT = "peer.example ";
+
+const Operation operations[] = {
+    onNode("updateConfig", configured, [](auto &node) { return node.updateConfig(false, true); }, KEPT,
+           {{"NLIBCSzHashAlloc", 18990001},
+            {"NLIBCFileLockByFile", 18990015},
+            {"NLIBCFileExist", 18990019, Then::CLEANS_UP}, // to it there is no file, and the section cannot be added
+            {"NLIBCFileGetSection", 18990017},
+            {"NLIBCSzHashSetValue", 18990032},
+            {"NLIBCFileSetSection", 18990018},
+            {"NLIBCFileUnlockByFile", 0, Then::ONLY_THE_LOG_TELLS}}),
+    onNode("deleteFromNodeConfig", configured, [](auto &node) { return node.deleteFromNodeConfig(); }, KEPT,
+           {{"NLIBCFileLockByFile", 18990015},
+            {"NLIBCFileExist", 0, Then::GOES_ON},
+            {"NLIBCFileRemoveSection", 18990020},
+            {"NLIBCFileUnlockByFile", 0, Then::ONLY_THE_LOG_TELLS}}),
+    onNode("ListNodeFromConfig", configured, listConfig, KEPT,
+           {{"NLIBCSzHashAlloc#1 NLIBCSzListAlloc", 18990001},
+            {"NLIBCFileLockByFile#1", 18990015},
+            {"NLIBCFileExist#1", 0, Then::GOES_ON},
+            {"NLIBCFileEnumSection", 18990301},
+            {"NLIBCFileUnlockByFile#1", 18990016},
+            {"NLIBCSzListGet NLIBCSzHashAlloc#2 NLIBCFileLockByFile#2 NLIBCFileExist#2 NLIBCFileGetSection "
+             "NLIBCSzHashGetValue",
+             18991112},
+            {"NLIBCFileUnlockByFile#2", 0, Then::ONLY_THE_LOG_TELLS}}),
+    onNode("GetNodeUUIDByHostname", configured, [](auto &node) { return select(node, "peer.example"); }, KEPT,
+           {{"DRNodeDB::Get DRNodeDB::List", 18991100}, {"DRNodeDB::ListAttr", 0, Then::GOES_ON}}),
+    onNode("GetNodeUUIDByIndex", configured, [](auto &node) { return select(node, "node#2"); }, KEPT,
+           {{"DRNodeDB::Get", 18991112}, {"DRNodeDB::List", 18991120}, {"DRNodeDB::ListAttr", 0, Then::GOES_ON}}),
+    onNode("insertRODKey", configured, [](auto &node) { return node.insertRODKey("key"); }, KEPT,
+           {{"DRNodeDB::SetAttr", 18991118}}),
+    onNode("loadLocalRODKey", configured, [](auto &node) { return node.loadLocalRODKey(node.session_id); }, KEPT, {}),
+    onNode("login", unconfigured, [](auto &node) { return node.login(); }, "",
+           {{"NLIBCSzHashAlloc#1 NLIBCFileLockByFile#1", 18991111},
+            {"NLIBCFileExist NLIBCFileGetSection#1", 0, Then::GOES_ON},
+            {"NLIBCFileUnlockByFile#1", 18990015, Then::CLEANS_UP}, // the next lock waits for none
+            {"NORVCredAlloc", 18990001, Then::CLEANS_UP},
+            {"NORVCredSessAlloc NORVCredItemSetHost NORVCredItemSetPort NORVCredItemSetProtocol "
+             "NORVCredItemSetRemoteAccount NORVCredItemSetRemotePasswd NLIBCSzHashAlloc#2",
+             18990001},
+            {"CredRequestUtil::LoginWithOTP", 18990205},
+            {"NORVCredSessItemGetAccessToken", 18990210},
+            {"NLIBCFileLockByFile#2", 18990015},
+            {"NLIBCFileGetSection#2", 18990017},
+            {"NLIBCSzHashSetValue", 18990032},
+            {"NLIBCFileTouch", 18990023},
+            {"NLIBCFileAddSection", 18990019},
+            {"NLIBCFileUnlockByFile#2", 0, Then::ONLY_THE_LOG_TELLS}}),
+    onNode(
+        "logout", configured, logOut, "",
+        {{"NLIBCFileLockByFile", 18990015},
+         {"NLIBCFileExist", 18990011, Then::STOPS_SILENTLY},
+         {"NLIBCFileGetSection", 18991109, Then::STOPS_SILENTLY},
+         {"NLIBCSzHashGetValue", 18991112},
+         {"NLIBCFileUnlockByFile", 0, Then::ONLY_THE_LOG_TELLS},
+         {"NLIBCSzHashAlloc NORVCredAlloc NORVCredItemSetHost NORVCredItemSetPort NORVCredItemSetProtocol", 18990001},
+         {"CredRequestUtil::Logout", 18990206}}),
+    onNode("createSession", configured, openSession, KEPT,
+           {{"NorvCgiInit", 18991113},
+            {"NORVUserGetUGID", 0, Then::GOES_ON},
+            {"NorvCgiSetOption", 18991115},
+            {"NorvCgiLoginNoAuth", 18991116}}),
+    onNode("deleteSession", configured, closeSession, "",
+           {{"NorvCgiInit", 18991113}, {"NorvCgiRemoveSessionByIndex", 18990000, Then::STOPS_SILENTLY}}),
+};
+
+INSTANTIATE_TEST_SUITE_P(NodeRecord, FailureSweep, testing::ValuesIn(operations), operationName);
 
 } // namespace
 } // namespace unit

@@ -98,18 +98,17 @@ void transfer()
 }
 
 /// Runs `act` on the virtual LUN; what it writes into the text is the outputs.
-template <class... Failures>
 Operation onVLUN(const char *name, int (*act)(ISCSILIBVLUN &, std::string &), const std::string &untouched,
-                 const Failures &...failures)
+                 const std::vector<Codes> &codes)
 {
     const auto run = [act] {
         ISCSILIBVLUN vlun(ISCSI::VLUN_TYPE_1, UUID);
         vlun.info.uuid = VLUN;
         std::string outputs;
         const int code = act(vlun, outputs);
-        return Outcome{code, vlun.info.toString(), outputs};
+        return Outcome{code, "", outputs + vlun.info.uuid};
     };
-    return operation(name, transfer, run, untouched, failures...);
+    return sweptForCodes(name, transfer, run, untouched, codes);
 }
 
 int status(ISCSILIBVLUN &vlun, std::string &outputs)
@@ -117,51 +116,22 @@ int status(ISCSILIBVLUN &vlun, std::string &outputs)
     int state = 9;
     unsigned long long first = 9, second = 9;
     const int code = vlun.loadStatus(state, first, second);
-    outputs = std::to_string(state) + " " + std::to_string(first) + " " + std::to_string(second);
+    outputs = std::to_string(state) + std::to_string(first) + std::to_string(second);
     return code;
-}
-
-int create(ISCSILIBVLUN &vlun, std::string &outputs)
-{
-    vlun.info.uuid.clear();
-    const int code = vlun.createVLUN();
-    outputs = vlun.info.uuid;
-    return code;
-}
-
-int load(ISCSILIBVLUN &vlun, std::string &outputs)
-{
-    const int code = vlun.info.loadFromConfig(vlun.record, 0);
-    outputs = vlun.info.uuid;
-    return code;
-}
-
-std::string refused(const std::string &method, const std::string &sentence)
-{
-    return method + ": " + sentence + " vLUN: {info}. error: {code}";
 }
 
 const Operation operations[] = {
-    onVLUN("createVLUN", create, "",
-           stops("NORViSCSIVirtualLunCreate", 18991003, refused("createVLUN", "Failed to create vLUN."))),
-    onVLUN(
-        "deleteVLUN", [](auto &vlun, auto &) { return vlun.deleteVLUN(); }, "",
-        stops("NORViSCSIVirtualLunRemove", 18991006, refused("deleteVLUN", "Failed to delete vLUN."))),
-    onVLUN("loadStatus", status, "9 9 9",
-           stops("NORViSCSIVirtualLunStatsGet", 18991007, refused("loadStatus", "Failed to load status."))),
-    onVLUN(
-        "bind", [](auto &vlun, auto &) { return vlun.bind("dst", PEER_NODE, {"portal"}); }, "",
-        stops("DRNodeDB::Get", 18991112,
-              std::string("loadFromDRNode: Failed to get node info from DR Node. UUID: ") + PEER_NODE,
-              std::string("bind: Failed to load destination node info. node: uuid: ") + PEER_NODE +
-                  " ,is_local_node: false ,rod_key:  ,hostname:  ,port: 0 ,protocol:  ,session_id: "),
-        goesOn("DRNodeDB::ListAttr"),
-        stops("NORViSCSIVirtualLunBindSink", 18991004, refused("bind", "Failed to bind vLUN."))),
-    onVLUN("VLUNLoadFromConfig", load, VLUN,
-           stops("NORViSCSIVirtualLunFillByUUID", 18991005,
-                 "loadFromConfig: Failed to load vLUN info from SDK. vLUN: {info}"),
-           stops("NORViSCSILunGetByLunId", 18990531, "GetUUIDByLID: No such LUN. LUN ID: 3",
-                 "loadFromConfig: Failed to get source LUN UUID. vLUN: {info}")),
+    onVLUN("createVLUN", [](auto &vlun, auto &) { return vlun.createVLUN(); }, VLUN,
+           {{"NORViSCSIVirtualLunCreate", 18991003}}),
+    onVLUN("deleteVLUN", [](auto &vlun, auto &) { return vlun.deleteVLUN(); }, VLUN,
+           {{"NORViSCSIVirtualLunRemove", 18991006}}),
+    onVLUN("loadStatus", status, "999" + VLUN, {{"NORViSCSIVirtualLunStatsGet", 18991007}}),
+    onVLUN("bind", [](auto &vlun, auto &) { return vlun.bind("dst", PEER_NODE, {"portal"}); }, VLUN,
+           {{"DRNodeDB::Get", 18991112},
+            {"DRNodeDB::ListAttr", 0, Then::GOES_ON},
+            {"NORViSCSIVirtualLunBindSink", 18991004}}),
+    onVLUN("VLUNLoadFromConfig", [](auto &vlun, auto &) { return vlun.info.loadFromConfig(vlun.record, 0); }, VLUN,
+           {{"NORViSCSIVirtualLunFillByUUID", 18991005}, {"NORViSCSILunGetByLunId", 18990531}}),
 };
 
 INSTANTIATE_TEST_SUITE_P(VirtualLUNs, FailureSweep, testing::ValuesIn(operations), operationName);
