@@ -1,5 +1,6 @@
 #include "host/core/KeyValueFile.h"
 
+#include "host/core/FileContent.h"
 #include "host/core/FileDescriptor.h"
 #include "host/core/LastError.h"
 #include "platform/core.h"
@@ -16,14 +17,6 @@ namespace norvhost {
 namespace {
 
 constexpr size_t largest_file = 1 << 20;
-
-std::string_view trimmed(std::string_view text)
-{
-    constexpr std::string_view blanks = " \t\r\v\f";
-    const size_t begin = text.find_first_not_of(blanks);
-    return begin == std::string_view::npos ? std::string_view()
-                                           : text.substr(begin, text.find_last_not_of(blanks) + 1 - begin);
-}
 
 std::string_view unquoted(std::string_view value)
 {
@@ -48,20 +41,8 @@ int readWhole(const char *path, std::string &text)
         return refuse(errno, path);
     if (!S_ISREG(status.st_mode))
         return refuse(S_ISDIR(status.st_mode) ? EISDIR : EINVAL, path);
-    text.clear();
-    char buffer[4096];
-    for (;;) {
-        const ssize_t count = read(file.get(), buffer, sizeof buffer);
-        if (count < 0 && errno == EINTR)
-            continue;
-        if (count < 0)
-            return refuse(errno, path);
-        if (count == 0)
-            return 0;
-        text.append(buffer, static_cast<size_t>(count));
-        if (text.size() > largest_file)
-            return refuse(EFBIG, path);
-    }
+    const int err = readAll(file.get(), largest_file, text);
+    return err ? refuse(-err, path) : 0;
 }
 
 /// 1, 0 or negative, as NLIBCFileGetKeyValue.

@@ -1,5 +1,6 @@
 #include "host/core/SectionFile.h"
 
+#include "host/core/FileContent.h"
 #include "host/core/LastError.h"
 #include "host/core/OwnFile.h"
 #include "host/core/StringHash.h"
@@ -21,14 +22,6 @@ constexpr std::string_view placeholder = "%s";
 bool hasControlCharacter(std::string_view text)
 {
     return std::any_of(text.begin(), text.end(), [](unsigned char c) { return c < ' ' || c == 0x7f; });
-}
-
-std::string_view trimmed(std::string_view text)
-{
-    constexpr std::string_view blanks = " \t\r\v\f\n";
-    const size_t begin = text.find_first_not_of(blanks);
-    return begin == std::string_view::npos ? std::string_view()
-                                           : text.substr(begin, text.find_last_not_of(blanks) + 1 - begin);
 }
 
 /// The name in a header line, empty for another line.
@@ -152,29 +145,10 @@ private:
         FileDescriptor file;
         if (int err = openOwnFile(place, O_RDONLY, file))
             return err;
-        char buffer[4096];
-        for (ssize_t count; (count = ::read(file.get(), buffer, sizeof buffer)) != 0;) {
-            if (count < 0 && errno != EINTR)
-                return failed("cannot read");
-            if (count > 0)
-                content.append(buffer, static_cast<size_t>(count));
-            if (content.size() > largest_file)
-                return failed("cannot read more than 1 MiB of", EFBIG);
-        }
+        if (int err = readAll(file.get(), largest_file, content))
+            return failed("cannot read", -err);
         sections = splitSections(content);
         return 0;
-    }
-
-    static bool writeAll(int fd, std::string_view text)
-    {
-        while (!text.empty()) {
-            const ssize_t count = write(fd, text.data(), text.size());
-            if (count < 0 && errno != EINTR)
-                return false;
-            if (count > 0)
-                text.remove_prefix(static_cast<size_t>(count));
-        }
-        return true;
     }
 
     FilePlace place;
