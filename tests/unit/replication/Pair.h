@@ -50,6 +50,13 @@ inline void sourceSide()
     fake::model().peer.base_version = BASE;
 }
 
+/// A source LUN that has no task yet.
+inline void noTask()
+{
+    sourceSide();
+    fake::model().tasks.clear();
+}
+
 /// The destination's half: a sink LUN whose snapshot stems from the source's first, modified since.
 inline void destinationSide()
 {

@@ -36,12 +36,6 @@ Operation onTask(const char *name, void (*set_up)(), int (*act)(ISCSILIBReplicat
     return sweptForCodes(name, set_up, run, untouched, codes);
 }
 
-void noTask()
-{
-    sourceSide();
-    fake::model().tasks.clear();
-}
-
 void sourceBehind()
 {
     sourceSide();
