@@ -7,6 +7,7 @@ import sys
 
 import clones
 import conformance
+import snapshots
 import web
 from machines import MIB, PLAIN_TARGET, VOLUME, PlainTgtd, appliance, make_lun, run
 from report import alternate, heading, misses, row, seconds
@@ -18,16 +19,25 @@ def records():
     heading("The library on the fake platform, beside the same work done by hand")
     report = json.loads(run(f"{HERE}/bench_records", "--benchmark_format=json", "--benchmark_repetitions=9",
                             "--benchmark_min_time=0.1", "--benchmark_report_aggregates_only=true",
-                            "--benchmark_enable_random_interleaving=true"))
-    median = {entry["run_name"]: entry["cpu_time"] / 1000 for entry in report["benchmarks"]
+                            "--benchmark_enable_random_interleaving=true", "--benchmark_filter=-Memory"))
+    unit = {"ns": 1e-3, "ms": 1e3}
+    median = {entry["run_name"]: entry["cpu_time"] * unit[entry["time_unit"]] for entry in report["benchmarks"]
               if entry["aggregate_name"] == "median"}
-    answer = median["platformAnswer"]
-    row("ListLUN, 1,024 LUNs", median["listLUN"], median["plainLoop"], "us", median["listLUN"] / median["plainLoop"], 1.5)
-    row("  the same without the platform's answer", median["listLUN"] - answer, median["plainLoop"] - answer, "us",
-        (median["listLUN"] - answer) / (median["plainLoop"] - answer))
+    for what, ours, peer, answer in (("ListLUN, 1,024 LUNs", "listLUN", "plainLoop", "platformAnswer"),
+                                     ("ListSnapshot, 65,536", "listSnapshot", "plainSnapshotWalk", "snapshotAnswer")):
+        ours, peer, answer = median[ours], median[peer], median[answer]
+        row(what, ours, peer, "us", ours / peer, 1.5)
+        row("  the same without the platform's answer", ours - answer, peer - answer, "us",
+            (ours - answer) / (peer - answer))
     for what, ours, peer in (("toString of one LUN", "recordToString", "plainToString"),
                              ("toJsonFormat of one LUN", "recordToJson", "plainToJson")):
         row(what, median[ours], median[peer], "us", median[ours] / median[peer])
+    counted = json.loads(run(f"{HERE}/bench_records", "--benchmark_format=json", "--benchmark_filter=Memory"))
+    used = {key: counted["benchmarks"][0][key] / MIB for key in ("list", "peak", "records")}
+    row("ListSnapshot's peak; the SDK's list + records", used["peak"], used["list"] + used["records"], "MiB",
+        used["peak"] / (used["list"] + used["records"]))
+    row("  above the list; the records", used["peak"] - used["list"], used["records"], "MiB",
+        (used["peak"] - used["list"]) / used["records"], 1.3)
 
 
 def listing(count=1024, targets=16):
@@ -84,6 +94,8 @@ def main():
     records()
     with appliance("8G"):
         transfers()
+        snapshots.taking()
+        snapshots.exports()
         print("\nThe SCSI test suite (iscsi-test-cu, one process a suite)")
         if conformance.compare():
             misses.append("iscsi-test-cu")

@@ -1,20 +1,25 @@
-// What the library costs above the platform's answer: listing, and one record as text and as JSON.
+// What the library costs above the platform's answer: listings, and one record as text and as JSON.
 #include "iscsiwebapi/ISCSILUNInfo.h"
+#include "iscsiwebapi/ISCSISnapshotInfo.h"
 #include "platform/iscsi_lun.h"
 #include "tests/fake/Fake.h"
 
 #include <benchmark/benchmark.h>
 #include <json/value.h>
+#include <malloc.h>
 
 #include <cstdio>
 #include <cstdlib>
+#include <fstream>
 #include <memory>
 #include <string>
+#include <utility>
 #include <vector>
 
 namespace {
 
 constexpr int LUN_COUNT = 1024;
+constexpr int SNAPSHOT_COUNT = 65536;
 
 /// What a program without this library would keep of a LUN.
 struct PlainLUN {
@@ -96,6 +101,140 @@ void listLUN(benchmark::State &state)
     }
 }
 BENCHMARK(listLUN);
+
+/// What a program without this library would keep of a snapshot.
+struct PlainSnapshot {
+    int snapshot_id;
+    int parent_lun_id;
+    unsigned long long total_size;
+    unsigned long long mapped_size;
+    long create_time;
+    long snapshot_time;
+    bool is_app_consistent;
+    bool is_user_locked;
+    std::string name, status, description, root_path, taken_by, uuid, version;
+};
+
+void fillSnapshots()
+{
+    fake::reset();
+    for (int lid = 1; lid <= SNAPSHOT_COUNT / NORV_SNAPSHOT_ID_MAX; ++lid) {
+        for (int number = 1; number <= NORV_SNAPSHOT_ID_MAX; ++number) {
+            _tag_iscsi_snapshot_ &record = fake::model().snapshots[{lid, number}].record;
+            record.lid = lid;
+            record.snap_id = number;
+            record.total_size = 10ULL << 30;
+            record.snap_time = record.create_time = 1700000000 + number;
+            std::snprintf(record.uuid, sizeof(record.uuid), "%08x-%04x-4000-8000-000000000000", lid, number);
+            std::snprintf(record.version, sizeof(record.version), "%s", record.uuid);
+            std::snprintf(record.name, sizeof(record.name), "production-database-%d-%d", lid, number);
+            std::snprintf(record.status, sizeof(record.status), "Healthy");
+            std::snprintf(record.desc, sizeof(record.desc), "before the update of the accounting of department %d",
+                          lid);
+            std::snprintf(record.root_path, sizeof(record.root_path), "/volume1");
+            std::snprintf(record.taken_by, sizeof(record.taken_by), "schedule");
+        }
+    }
+}
+
+struct SnapshotList : _tag_iscsi_snapshot_list_ {
+    SnapshotList() : _tag_iscsi_snapshot_list_{}
+    {
+        const _tag_iscsi_snapshot_query_ all{};
+        if (NORViSCSISnapshotConfLoad(&all, this) || count != SNAPSHOT_COUNT)
+            std::abort();
+        fake::forgetCalls();
+    }
+    SnapshotList(const SnapshotList &) = delete;
+    SnapshotList &operator=(const SnapshotList &) = delete;
+    ~SnapshotList()
+    {
+        while (first)
+            std::free(std::exchange(first, first->next));
+    }
+};
+
+void snapshotAnswer(benchmark::State &state)
+{
+    fillSnapshots();
+    for (auto _ : state)
+        benchmark::DoNotOptimize(SnapshotList().first);
+}
+BENCHMARK(snapshotAnswer)->Unit(benchmark::kMillisecond);
+
+void plainSnapshotWalk(benchmark::State &state)
+{
+    fillSnapshots();
+    for (auto _ : state) {
+        const SnapshotList list;
+        std::vector<PlainSnapshot> out;
+        out.reserve(static_cast<size_t>(list.count));
+        for (const _tag_iscsi_snapshot_ *record = list.first; record; record = record->next)
+            out.push_back({record->snap_id, record->lid, record->total_size, record->mapped_size, record->create_time,
+                           record->snap_time, record->app_consistent != 0, record->user_locked != 0, record->name,
+                           record->status, record->desc, record->root_path, record->taken_by, record->uuid,
+                           record->version});
+        benchmark::DoNotOptimize(out.data());
+    }
+}
+BENCHMARK(plainSnapshotWalk)->Unit(benchmark::kMillisecond);
+
+void listSnapshot(benchmark::State &state)
+{
+    fillSnapshots();
+    for (auto _ : state) {
+        std::vector<ISCSI::ISCSISnapshotInfo> out;
+        if (ISCSI::ISCSISnapshotInfo::ListSnapshot(-1, out, 0, 0) || out.size() != SNAPSHOT_COUNT)
+            state.SkipWithError("ListSnapshot failed");
+        fake::forgetCalls();
+        benchmark::DoNotOptimize(out.data());
+    }
+}
+BENCHMARK(listSnapshot)->Unit(benchmark::kMillisecond);
+
+/// A line of /proc/self/status, in bytes.
+double memory(const std::string &key)
+{
+    std::ifstream status("/proc/self/status");
+    for (std::string word; status >> word;)
+        if (word == key + ":") {
+            double kibibytes = 0;
+            status >> kibibytes;
+            return kibibytes * 1024;
+        }
+    std::abort();
+}
+
+size_t heapBytes(const std::string &text)
+{
+    constexpr size_t longest_inside = 15;
+    return text.size() <= longest_inside ? 0 : malloc_usable_size(const_cast<char *>(text.data()));
+}
+
+/// Not a matter of time: the counters say what the SDK's list, our records, and the whole listing at its peak take, in
+/// bytes. To be run in a process of its own, whose heap has no holes yet.
+void listSnapshotMemory(benchmark::State &state)
+{
+    fillSnapshots();
+    std::vector<ISCSI::ISCSISnapshotInfo> out;
+    for (auto _ : state) {
+        std::ofstream("/proc/self/clear_refs") << 5; // the peak begins anew
+        const double before = memory("VmRSS");
+        if (ISCSI::ISCSISnapshotInfo::ListSnapshot(-1, out, 0, 0))
+            state.SkipWithError("ListSnapshot failed");
+        state.counters["peak"] = memory("VmHWM") - before;
+    }
+    size_t records = 0;
+    for (const ISCSI::ISCSISnapshotInfo &snapshot : out) {
+        records += sizeof(snapshot);
+        for (const std::string *text : {&snapshot.name, &snapshot.status, &snapshot.description, &snapshot.root_path,
+                                        &snapshot.taken_by, &snapshot.uuid, &snapshot.version})
+            records += heapBytes(*text);
+    }
+    state.counters["records"] = static_cast<double>(records);
+    state.counters["list"] = static_cast<double>(SNAPSHOT_COUNT * sizeof(_tag_iscsi_snapshot_));
+}
+BENCHMARK(listSnapshotMemory)->Iterations(1);
 
 ISCSI::ISCSILUNInfo oneLUN()
 {

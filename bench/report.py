@@ -10,10 +10,12 @@ def heading(text):
     print(f"\n{text}\n  {'':<44}{'ours':>11} {'peer':>11} {'':<6}{'ratio':>7}", flush=True)
 
 
-def row(what, ours, peer, unit, ratio, limit=None):
-    """A ratio above the limit is a miss, which makes the run fail."""
-    verdict = "" if limit is None else f"  (limit {limit:.2f})" if ratio <= limit else f"  ABOVE {limit:.2f}"
-    if limit is not None and ratio > limit:
+def row(what, ours, peer, unit, ratio, limit=None, slack=0):
+    """A ratio above the limit is a miss, which makes the run fail; `slack` is what ours may take beside it."""
+    is_missed = limit is not None and ratio > limit + slack / peer
+    text = "" if limit is None else f"{limit:.2f} + {slack} {unit}" if slack else f"{limit:.2f}"
+    verdict = f"  ABOVE {text}" if is_missed else f"  (limit {text})" if text else ""
+    if is_missed:
         misses.append(what)
     print(f"  {what:<44}{ours:>11.3f} {peer:>11.3f} {unit:<6}{ratio:>7.2f}{verdict}", flush=True)
 
