@@ -3,7 +3,7 @@
 
 namespace contract {
 
-Platform::Platform() : volume("/volume1")
+Platform::Platform() : volume("/volume1"), folder("/usr/norv/contract")
 {
     fake::reset();
 }

@@ -33,6 +33,7 @@ public:
         setenv("ISCSI_HOST_STATE", (folder + "/state").c_str(), 1);
         setenv("ISCSI_HOST_RUN", (folder + "/run").c_str(), 1);
         volume = folder + "/volume";
+        files = folder + "/files";
         std::filesystem::create_directory(volume);
         require(iscsihost::addVolume(volume), "addVolume");
     }
@@ -55,7 +56,7 @@ public:
         require(iscsihost::boot(report), "boot");
     }
 
-    std::string volume;
+    std::string volume, files;
 
 private:
     std::string folder;
@@ -87,12 +88,16 @@ void removeLUNs()
 
 } // namespace
 
-Platform::Platform() : volume(host->volume) {}
+Platform::Platform() : volume(host->volume), folder(host->files)
+{
+    std::filesystem::create_directory(folder);
+}
 
 Platform::~Platform()
 {
     removeTargets();
     removeLUNs();
+    std::filesystem::remove_all(folder);
 }
 
 void Platform::startService()

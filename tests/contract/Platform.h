@@ -22,6 +22,7 @@ public:
     void addRetentionPolicy(int lid);
 
     std::string volume; ///< a location for LUNs, with room for a few small ones
+    std::string folder; ///< for the platform's own files; empty
 };
 
 /// Copies a text into a character field.

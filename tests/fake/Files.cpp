@@ -55,6 +55,15 @@ std::string keyLines(const NLIBC_SZ_HASH &hash, const char *format)
     return lines;
 }
 
+/// Whether the section can be written and read back: no text of it may end its line.
+bool isWritable(const std::string &section, const NLIBC_SZ_HASH &hash)
+{
+    const auto breaks = [](const std::string &text) { return text.find_first_of("\r\n") != std::string::npos; };
+    return !section.empty() && !breaks(section) &&
+           std::none_of(hash.values.begin(), hash.values.end(),
+                        [&](const auto &entry) { return breaks(entry.first) || breaks(entry.second); });
+}
+
 struct LockFiles {
     std::map<std::string, int> files; ///< by path: a descriptor to open the file by
     std::set<int> taken;
@@ -187,7 +196,7 @@ int NLIBCFileAddSection(const char *path, const char *section, const NLIBC_SZ_HA
 {
     if (auto failure = called(__func__, path, section, keyLines(*keys, line_format)))
         return *failure;
-    if (model().section_files.count(path) == 0 || findSection(path, section))
+    if (model().section_files.count(path) == 0 || findSection(path, section) || !isWritable(section, *keys))
         return 0;
     model().section_files[path].push_back({section, keys->values});
     return 1;
@@ -199,7 +208,8 @@ int NLIBCFileSetSection(const char *path, const char *section, const char *new_n
     if (auto failure = called(__func__, path, section, new_name, keyLines(*keys, line_format)))
         return *failure;
     Section *known = findSection(path, section);
-    if (!known)
+    const bool is_taken = strcmp(section, new_name) != 0 && findSection(path, new_name);
+    if (!known || is_taken || !isWritable(new_name, *keys))
         return 0;
     *known = {new_name, keys->values};
     return 1;
