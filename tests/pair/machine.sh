@@ -13,6 +13,17 @@ for folder in /etc /var; do
     mkdir -p "/run/layers$folder/upper" "/run/layers$folder/work"
     mount -t overlay overlay -o "lowerdir=$folder,upperdir=/run/layers$folder/upper,workdir=/run/layers$folder/work" "$folder"
 done
+# A /dev of its own, for a system log of its own.
+mkdir /run/dev
+mount -t tmpfs -o mode=0755 tmpfs /run/dev
+cp -a /dev/{full,null,ptmx,random,tty,urandom,zero,loop-control} /run/dev/
+for number in {0..63}; do
+    mknod -m 0660 "/run/dev/loop$number" b 7 "$number"
+done
+mkdir -m 1777 /run/dev/shm
+mkdir /run/dev/pts
+mount --bind /dev/pts /run/dev/pts
+mount --move /run/dev /dev
 mkdir -p /var/lib/iscsi-host
 chmod 700 /var/lib/iscsi-host
 mount -t tmpfs -o mode=0700 tmpfs /var/lib/iscsi-host # not on the overlay: it holds the volume's image

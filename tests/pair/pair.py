@@ -11,6 +11,7 @@ import signal
 import socket
 import subprocess
 import sys
+import threading
 import time
 
 HERE = os.path.dirname(os.path.abspath(__file__))
@@ -65,6 +66,7 @@ class Machine:
         self.holder.stdin.write(address + "\n")
         self.holder.stdin.flush()
         self._expect("ready")
+        self._take_log()
         os.makedirs(MACHINES, exist_ok=True)
         with open(f"{MACHINES}/{name}", "w", encoding="ascii") as file:
             file.write(f"{self.pid}\n")
@@ -80,6 +82,17 @@ class Machine:
             run("ip", "link", "set", BRIDGE, "up")
         run("ip", "link", "add", self.name, "type", "veth", "peer", "name", "eth0", "netns", str(self.pid))
         run("ip", "link", "set", self.name, "master", BRIDGE, "up")
+
+    def _take_log(self):
+        self.log_lines = []
+        receiver = socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM)
+        receiver.bind(f"/proc/{self.pid}/root/dev/log")
+
+        def take():
+            while True:
+                self.log_lines.append(receiver.recv(8192).decode(errors="replace"))
+
+        threading.Thread(target=take, daemon=True).start()
 
     def power_off(self):
         """The machine and everything on it is gone, at once."""
