@@ -167,3 +167,17 @@ int iscsihost::endReception(const std::string &task_uuid, const std::string &ver
         return err;
     return updateArrival(destination.task.record.uuid, {});
 }
+
+int iscsihost::arrivedBytes(const std::string &lun_uuid, uint64_t &bytes)
+{
+    LunRow lun;
+    TransferCount count;
+    if (int err = loadLunByUuid(lun_uuid, lun))
+        return err;
+    if (isExtentPool(lun.record.type)) {
+        if (int err = readTransferCount(dataPath(lun.record), Transfer::sending, count))
+            return err;
+    }
+    bytes = count.done < count.total ? count.done : 0;
+    return 0;
+}

@@ -115,9 +115,6 @@ Result showRemoteClone(const Request &request);
 Result openSink(const Request &request);
 Result closeSink(const Request &request);
 
-/// Bytes that have arrived of a copy that is under way, else 0.
-Json::UInt64 syncProgress(unsigned long long done, unsigned long long total);
-
 /// Resolves a LUN selector to a UUID (which may name no LUN), or a target selector to a target ID
 /// (which may name no target).
 Result selectLun(const std::string &selector, std::string &uuid);

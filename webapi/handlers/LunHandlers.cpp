@@ -1,6 +1,7 @@
 #include "webapi/handlers/Handlers.h"
 
 #include "iscsihost/host.h"
+#include "iscsihost/replication.h"
 #include "iscsiwebapi/ISCSIErrorCode.h"
 #include "iscsiwebapi/ISCSILIBLUN.h"
 #include "iscsiwebapi/ISCSILIBTarget.h"
@@ -45,11 +46,9 @@ Result describe(const std::string &uuid)
     if (int err = lun.info.toJsonFormat(result.value))
         return failed(err);
     addAllocatedSize(lun.info, lun.record, result.value);
-    unsigned long long done = 0, total = 0;
-    if (lun.info.loadSyncProgress(lun.record, done, total) == 0)
-        result.value["sync_progress"] = syncProgress(done, total);
-    else
-        result.value["sync_progress"] = 0u; // its data is missing or damaged
+    uint64_t arrived = 0;
+    iscsihost::arrivedBytes(uuid, arrived); // 0 where it cannot be told, too: the data is missing or damaged
+    result.value["sync_progress"] = static_cast<Json::UInt64>(arrived);
 
     Json::Value &mappings = result.value["targets"] = Json::arrayValue;
     if (!lun.info.is_mapped)
@@ -92,11 +91,6 @@ Result selectTargets(const Json::Value &selectors, std::set<int> &tids)
 }
 
 } // namespace
-
-Json::UInt64 syncProgress(unsigned long long done, unsigned long long total)
-{
-    return done < total ? done : 0;
-}
 
 Result selectLun(const std::string &selector, std::string &uuid)
 {

@@ -35,7 +35,7 @@ Result describe(const std::string &uuid)
     unsigned long long done = 0, total = 0;
     if (int err = snapshot.loadSyncProgress(done, total))
         return failed(err);
-    result.value["sync_progress"] = syncProgress(done, total);
+    result.value["sync_progress"] = static_cast<Json::UInt64>(done < total ? done : 0);
     return result;
 }
 

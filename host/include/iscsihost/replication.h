@@ -41,4 +41,7 @@ ISCSI_HOST_API int noteReception(const std::string &task_uuid, const std::string
 /// All has arrived and is flushed: the version is the LUN's base now. Codes as above.
 ISCSI_HOST_API int endReception(const std::string &task_uuid, const std::string &version);
 
+/// Bytes that have arrived so far of the state that arrives at a LUN; 0 when none does.
+ISCSI_HOST_API int arrivedBytes(const std::string &lun_uuid, uint64_t &bytes);
+
 } // namespace iscsihost
