@@ -79,7 +79,7 @@ class PairTest(unittest.TestCase):
 def main():
     if os.geteuid() != 0:
         sys.exit("this test makes namespaces and runs daemons: it needs root")
-    if not os.path.isdir("/run/world"):
+    if not os.path.isdir("/run/world/tree"):
         build = os.environ["BUILD_DIR"]
         os.execv(f"{pair.HERE}/../../demo/world.sh", ["world.sh", build, "python3", "-B", "tests/pair/" + os.path.basename(sys.argv[0]),
                                                       *sys.argv[1:]])
