@@ -125,7 +125,7 @@ Decision StoreDirectory::decide(const std::string &initiator, const std::string 
     if (!isListed(masking, initiator, permission))
         decision = bindLearned(daemon, initiator, wanted);
     if (decision.status == login_moved && target.max_sessions > 0)
-        redirected.push_back({target.tid, initiator, Clock::now() + redirect_limit});
+        redirected.push_back({target.iqn, initiator, Clock::now() + redirect_limit});
     return decision;
 }
 
@@ -143,7 +143,7 @@ bool StoreDirectory::isFull(const _tag_iscsi_target_ &target, const Tgtd &daemon
     redirected.erase(std::remove_if(redirected.begin(), redirected.end(),
                                     [&](const Redirected &entry) {
                                         const bool arrived =
-                                            entry.tid == target.tid &&
+                                            entry.target == target.iqn &&
                                             std::any_of(connections.begin(), connections.end(),
                                                         [&](const auto &c) { return c.initiator == entry.initiator; });
                                         return arrived || entry.until < Clock::now();
@@ -151,7 +151,7 @@ bool StoreDirectory::isFull(const _tag_iscsi_target_ &target, const Tgtd &daemon
                      redirected.end());
     // An initiator that asks again takes the place that it was promised before.
     const auto others = std::count_if(redirected.begin(), redirected.end(), [&](const Redirected &entry) {
-        return entry.tid == target.tid && entry.initiator != initiator;
+        return entry.target == target.iqn && entry.initiator != initiator;
     });
     return connections.size() + static_cast<size_t>(others) >= target.max_sessions;
 }

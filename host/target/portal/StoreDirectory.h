@@ -25,7 +25,7 @@ public:
 private:
     /// A login on its way from here to a daemon, which its daemon does not count yet.
     struct Redirected {
-        int tid;
+        std::string target; ///< its name: target IDs are used again
         std::string initiator;
         std::chrono::steady_clock::time_point until;
     };
