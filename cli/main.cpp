@@ -59,6 +59,9 @@ const char *hint(int code)
         return "'iscsictl target list' shows the targets";
     case ISCSI::ERR_NO_SUCH_NODE:
         return "'iscsictl node list' shows the nodes, 'iscsictl node join' adds one";
+    case ISCSI::ERR_FAILED_TO_LOGIN:
+        return cli::remote() ? nullptr
+                             : "a node that has forgotten this appliance is removed and joined again: 'iscsictl node'";
     case ISCSI::ERR_BAD_VLUN_UUID:
         return "'iscsictl vlun list' shows the virtual LUNs";
     case ISCSI::ERR_LUN_IS_MAPPED:

@@ -273,7 +273,7 @@ class Answers(Remote):
 
 class Table(Remote):
     def test_every_route_has_a_verb(self):
-        self.set_answer("POST /luns/a/remote-clone", {"dst_lun_uuid": UUID})
+        self.set_answer("POST /luns/a/remote-clone", {"vlun_uuid": UUID, "dst_lun_uuid": UUID})
         self.set_answer("GET /luns/a/remote-clone", {"is_running": False, "status": "complete"})
         self.set_answer("GET /peer-key", {"pin": self.pin})
         self.set_answer("GET /luns/a", {"uuid": UUID})

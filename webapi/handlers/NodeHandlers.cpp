@@ -370,7 +370,7 @@ Result logoutNode(const Request &request)
     if (Result bad = selectPeer(request, node); bad.code)
         return bad;
     if (!node.isInConfig())
-        return failed(ERR_NO_SUCH_NODE, "it is not logged in to");
+        return failed(ERR_FAILED_TO_LOGOUT, "it is not logged in to");
     ISCSINodeInfo open(node.uuid);
     open.logged_in = true; // by another process, whose session the configuration has
     if (int err = open.logout())
