@@ -27,16 +27,18 @@ std::string movedText(const Json::Value &vlun)
 
 void printVlun(const Json::Value &vlun)
 {
-    print(keyValues({
+    std::vector<std::pair<std::string, std::string>> pairs = {
         {"UUID", vlun["uuid"].asString()},
         {"Source LUN", vlun["src_lun_uuid"].asString()},
         {"Node", vlun["node_uuid"].asString()},
         {"Destination LUN", vlun["dst_lun_uuid"].asString()},
         {"Portal", vlun["portal"].asString()},
         {"Status", vlun["status"].asString()},
-        {"Reason", vlun["reason"].asString()},
         {"Moved", movedText(vlun)},
-    }));
+    };
+    if (!vlun["reason"].asString().empty())
+        pairs.emplace_back("Reason", vlun["reason"].asString());
+    print(keyValues(pairs));
 }
 
 void printList(const Json::Value &vluns)
@@ -88,10 +90,14 @@ void addPortals(CLI::App &verb, Json::Value &input)
         ->allow_extra_args(false);
 }
 
-/// How far the latest clone of the LUN to another node is.
-Progress askRemoteClone(const std::string &lun)
+/// How far the clone to another node is that this virtual LUN makes.
+Progress askRemoteClone(const std::string &lun, const Json::Value &vlun_uuid)
 {
-    const Json::Value told = request(Method::Get, lunPath(lun, "/remote-clone"));
+    if (vlun_uuid.isNull())
+        return {};
+    Json::Value input;
+    input["vlun_uuid"] = vlun_uuid;
+    const Json::Value told = request(Method::Get, lunPath(lun, "/remote-clone"), input);
     Progress progress;
     progress.running = told["is_running"].asBool();
     progress.done = told["first"].asUInt64();
@@ -115,13 +121,16 @@ void addRemoteClone(Commands &commands, CLI::App &noun)
         action.input = a->input;
         action.title = "Cloning " + a->selector + " to " + node;
         action.later = "'iscsictl vlun list' tells how far it is";
-        action.ask = [a] { return askRemoteClone(a->selector); };
+        Json::Value vlun_uuid;
+        action.ask = [&] { return askRemoteClone(a->selector, vlun_uuid); };
+        action.started = [&](const Json::Value &answer) { vlun_uuid = answer["vlun_uuid"]; };
         const Json::Value answer = a->watch ? watch(action) : request(Method::Post, action.path, action.input);
         if (a->json)
             return printJson(answer);
-        const std::string what = a->watch ? "Cloned " + a->selector + " to " + node + ": LUN "
-                                          : action.title + "; " + action.later + ": LUN ";
-        print(shown(what + answer["dst_lun_uuid"].asString()) + "\n");
+        const std::string copy = answer["dst_lun_uuid"].asString();
+        print(shown(a->watch ? "Cloned " + a->selector + " to " + node + ": LUN " + copy
+                             : action.title + " as LUN " + copy + "; " + action.later) +
+              "\n");
     });
     addPositional(verb, "LUN", a->selector, LUN_HELP);
     addText(verb, "--node", "NODE", a->input, "node", "The other appliance").required();

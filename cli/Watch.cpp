@@ -296,6 +296,8 @@ Json::Value watch(const Action &action)
         meter.show(askEarly(action));
     }
     Json::Value answer = request.answer();
+    if (action.started)
+        action.started(answer);
     for (Progress progress = action.ask();; progress = action.ask()) {
         if (progress.running || progress.total)
             meter.show(progress);

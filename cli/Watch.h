@@ -25,6 +25,8 @@ struct Action {
     std::string title;             ///< "Exporting vm1_nightly"
     std::string later;             ///< what tells about it when nobody watches any more
     std::function<Progress()> ask; ///< throws Failure when the action has failed
+    /// Hears the request's answer, for an `ask` that needs it; may be empty.
+    std::function<void(const Json::Value &)> started = nullptr;
 };
 
 /// Starts the action and shows on standard error how far it is, until it has ended: a bar on a terminal, else lines.

@@ -219,7 +219,7 @@ CREATE TABLE pins (
 ) STRICT, WITHOUT ROWID;
 
 -- Halves of replications. The latest sending from here; what arrives here: which state on which base, what the LUN held
--- before, and below which place it is flushed; the latest count of unsynchronised bytes.
+-- before, its snapshot's name on the peer, and below which place it is flushed; the latest count of unsynchronised bytes.
 CREATE TABLE replication_tasks (
     id INTEGER PRIMARY KEY,
     uuid TEXT NOT NULL UNIQUE,
@@ -238,6 +238,7 @@ CREATE TABLE replication_tasks (
     arriving TEXT NOT NULL DEFAULT '',
     arriving_base TEXT NOT NULL DEFAULT '',
     arriving_on TEXT NOT NULL DEFAULT '',
+    arriving_name TEXT NOT NULL DEFAULT '',
     arrived INTEGER NOT NULL DEFAULT 0,
     unsync_bytes INTEGER NOT NULL DEFAULT 0,
     unsync_completed INTEGER NOT NULL DEFAULT 0,
@@ -270,9 +271,10 @@ CREATE TABLE virtual_luns (
     state INTEGER NOT NULL DEFAULT 0
 ) STRICT;
 
--- Of each LUN, what the transfer had become whose virtual LUN was removed last.
+-- What transfers had become whose virtual LUNs were removed: the latest 16 of each LUN.
 CREATE TABLE removed_transfers (
-    lid INTEGER PRIMARY KEY REFERENCES luns ON DELETE CASCADE,
+    id INTEGER PRIMARY KEY, -- the virtual LUN's
+    lid INTEGER NOT NULL REFERENCES luns ON DELETE CASCADE,
     uuid TEXT NOT NULL,
     node TEXT NOT NULL,
     portal TEXT NOT NULL,
@@ -283,8 +285,10 @@ CREATE TABLE removed_transfers (
     state INTEGER NOT NULL
 ) STRICT;
 CREATE TRIGGER keep_removed_transfer AFTER DELETE ON virtual_luns WHEN OLD.sink <> '' BEGIN
-    INSERT OR REPLACE INTO removed_transfers VALUES
-        (OLD.lid, OLD.uuid, OLD.node, OLD.portal, OLD.sink, OLD.moved, OLD.total, OLD.ended, OLD.state);
+    INSERT INTO removed_transfers VALUES
+        (OLD.id, OLD.lid, OLD.uuid, OLD.node, OLD.portal, OLD.sink, OLD.moved, OLD.total, OLD.ended, OLD.state);
+    DELETE FROM removed_transfers WHERE lid = OLD.lid AND id NOT IN
+        (SELECT id FROM removed_transfers WHERE lid = OLD.lid ORDER BY id DESC LIMIT 16);
 END;
 )sql",
 };

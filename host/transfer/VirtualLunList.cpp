@@ -41,17 +41,6 @@ void addCounters(iscsihost::VirtualLun &vlun)
     vlun.running = stats.state == 0;
 }
 
-int find(Query &query, const std::string &src_lun_uuid, iscsihost::VirtualLun &vlun)
-{
-    const std::string uuid = lowerCase(src_lun_uuid);
-    query.bind(uuid);
-    if (query.next()) {
-        vlun = readRow(query);
-        return 0;
-    }
-    return query.error() ? query.error() : fail(BAD_VLUN_UUID, "the LUN was never sent to another node");
-}
-
 } // namespace
 } // namespace norvhost
 
@@ -75,26 +64,26 @@ int listVirtualLuns(std::vector<VirtualLun> &vluns)
     return 0;
 }
 
-int latestTransfer(const std::string &src_lun_uuid, VirtualLun &vlun)
+int findTransfer(const std::string &src_lun_uuid, const std::string &vlun_uuid, VirtualLun &vlun)
 {
+    const std::string lun = lowerCase(src_lun_uuid), one = lowerCase(vlun_uuid);
     VirtualLun found;
+    bool removed = false;
     {
-        Query query("SELECT " VLUN_COLUMNS " FROM virtual_luns JOIN luns USING (lid) "
-                    "WHERE luns.uuid = ?1 AND sink <> '' ORDER BY ended, virtual_luns.id DESC LIMIT 1");
-        const int err = find(query, src_lun_uuid, found);
-        if (err && err != BAD_VLUN_UUID)
-            return err;
-        if (!err) {
-            addCounters(found);
-            vlun = found;
-            return 0;
-        }
+        Query query("SELECT vluns.uuid, luns.uuid, node, sink, portal, moved, total, ended, state, removed FROM "
+                    "(SELECT id, uuid, lid, node, sink, portal, moved, total, ended, state, 0 AS removed "
+                    "FROM virtual_luns UNION ALL "
+                    "SELECT id, uuid, lid, node, sink, portal, moved, total, ended, state, 1 FROM removed_transfers) "
+                    "AS vluns JOIN luns USING (lid) "
+                    "WHERE luns.uuid = ?1 AND sink <> '' AND ?2 IN (vluns.uuid, '') ORDER BY id DESC LIMIT 1");
+        if (!query.bind(lun).bind(one).next())
+            return query.error() ? query.error() : fail(BAD_VLUN_UUID, "the LUN was never sent to another node");
+        found = readRow(query);
+        removed = query.integer(9) != 0;
     }
-    Query query("SELECT removed_transfers.uuid, luns.uuid, node, sink, portal, moved, total, ended, state "
-                "FROM removed_transfers JOIN luns USING (lid) WHERE luns.uuid = ?1");
-    if (int err = find(query, src_lun_uuid, found))
-        return err;
-    vlun = found;
+    if (!removed)
+        addCounters(found);
+    vlun = std::move(found);
     return 0;
 }
 

@@ -201,6 +201,10 @@ constexpr Field VLUN_CREATE[] = {
 
 constexpr Field PORTAL_ELEMENT[] = {{"", Type::Text, REQUIRED, 1, PORTAL_MAX_BYTES, ERR_BAD_PORTALS}};
 
+constexpr Field REMOTE_CLONE_SHOW[] = {
+    {"vlun_uuid", Type::Text, OPTIONAL, 1, UUID_BYTES, ERR_BAD_VLUN_UUID}, // the latest unless it is given
+};
+
 constexpr Field VLUN_BIND[] = {
     {"node", Type::Text, REQUIRED, 1, HOST_MAX_BYTES, ERR_BAD_NODE_UUID},
     {"dst_lun_uuid", Type::Text, REQUIRED, 1, UUID_BYTES, ERR_BAD_DESTINATION_LUN_UUID},
@@ -265,6 +269,7 @@ constexpr Field VERSIONS[] = {
 constexpr Field ARRIVAL_BEGIN[] = {
     {"version", Type::Text, REQUIRED, UUID_BYTES, UUID_BYTES, ERR_BAD_SENDING_SNAPSHOT_UUID},
     {"base", Type::Text, OPTIONAL, 0, UUID_BYTES, ERR_BAD_BASE_SNAPSHOT_UUID},
+    {"name", Type::Text, OPTIONAL, 0, NAME_MAX_BYTES, ERR_BAD_SNAPSHOT_NAME},
 };
 constexpr Field ARRIVAL[] = {
     {"version", Type::Text, REQUIRED, UUID_BYTES, UUID_BYTES, ERR_BAD_SENDING_SNAPSHOT_UUID},
@@ -307,7 +312,7 @@ const std::vector<Route> &routes()
         {Method::Post, "/luns/{lun}/load", Role::Admin, LUN_LOADING, loadLun},
         {Method::Post, "/luns/{lun}/unload", Role::Admin, LUN_LOADING, unloadLun},
         {Method::Post, "/luns/{lun}/clone", Role::Admin, CLONE, cloneLun},
-        {Method::Get, "/luns/{lun}/remote-clone", Role::Viewer, NONE, showRemoteClone},
+        {Method::Get, "/luns/{lun}/remote-clone", Role::Viewer, REMOTE_CLONE_SHOW, showRemoteClone},
         {Method::Post, "/luns/{lun}/remote-clone", Role::Admin, REMOTE_CLONE, remoteCloneLun},
         {Method::Get, "/luns/{lun}/import", Role::Viewer, NONE, showImport},
         {Method::Post, "/luns/{lun}/import", Role::Admin, DIRECTORY, importLun},

@@ -177,12 +177,12 @@ Result showRemoteClone(const Request &request)
     std::string lun_uuid;
     if (Result bad = selectLun(request.path.at("lun"), lun_uuid); bad.code)
         return bad;
-    VirtualLun latest;
-    if (int err = iscsihost::latestTransfer(lun_uuid, latest))
-        return err == ERR_BAD_VLUN_UUID ? failed(err, "it was never cloned to another node") : failed(err);
+    VirtualLun found;
+    if (int err = iscsihost::findTransfer(lun_uuid, request.input["vlun_uuid"].asString(), found))
+        return err == ERR_BAD_VLUN_UUID ? failed(err, "there is no such clone of it to another node") : failed(err);
     Result result;
-    result.value = describe(latest);
-    result.value["is_running"] = latest.running;
+    result.value = describe(found);
+    result.value["is_running"] = found.running;
     return result;
 }
 

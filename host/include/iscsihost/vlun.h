@@ -25,8 +25,9 @@ struct VirtualLun {
 /// Every virtual LUN, ascending by age.
 ISCSI_HOST_API int listVirtualLuns(std::vector<VirtualLun> &vluns);
 
-/// The transfer of a LUN that runs or, when none does, the one whose virtual LUN was removed last, as it was then. One
-/// that is neither running nor ended was stopped by the removal. 18991001 ("Bad vLUN UUID") when there never was one.
-ISCSI_HOST_API int latestTransfer(const std::string &src_lun_uuid, VirtualLun &vlun);
+/// The transfer of a LUN that this virtual LUN makes, with an empty UUID the latest; after the virtual LUN's removal as
+/// it was then, for the latest 16 of a LUN. One that is neither running nor ended was stopped by the removal. 18991001
+/// ("Bad vLUN UUID") when there is none.
+ISCSI_HOST_API int findTransfer(const std::string &src_lun_uuid, const std::string &vlun_uuid, VirtualLun &vlun);
 
 } // namespace iscsihost
