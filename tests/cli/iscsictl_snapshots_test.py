@@ -61,7 +61,7 @@ class Snapshots(Appliance):
         self.assertEqual(self.list(), [])
         self.write(b"1")
         one = self.take("--name", "one", "--note", "größe\x1b[2J", "--taken-by", "me", "--app-consistent")
-        self.assertEqual(set(one), KEYS)
+        self.assertEqual(set(one), KEYS | {"sync_progress"})
         self.assertEqual({key: one[key] for key in ("name", "lun_name", "description", "taken_by", "is_app_consistent",
                                                     "is_user_locked", "total_size", "mapped_size", "locked_app_keys")},
                          {"name": "one", "lun_name": "vm", "description": "größe\x1b[2J", "taken_by": "me",
@@ -72,6 +72,7 @@ class Snapshots(Appliance):
         self.take("--name", "one", lun="other")
         self.assertEqual([(s["lun_name"], s["name"]) for s in self.list()],
                          [("vm", "one"), ("vm", two["name"]), ("other", "one")])
+        self.assertEqual([snapshot.pop("sync_progress") for snapshot in (one, two)], [0, 0]) # not in lists
         self.assertEqual(self.list("vm"), [one, two])
         text = self.ok("snapshot", "show", "vm_one")
         self.assertIn(r"größe\x1b[2J", text)

@@ -38,7 +38,7 @@ class Luns(Appliance):
                          ("vol1", 7, 1536 * MIB, self.volume, False))
 
         shown = json.loads(self.ok("lun", "show", "vol1", "--json"))
-        self.assertEqual(set(shown), LUN_KEYS | STATUS_KEYS | {"targets"})
+        self.assertEqual(set(shown), LUN_KEYS | STATUS_KEYS | {"targets", "sync_progress"})
         self.assertEqual(shown["targets"], [])
         text = self.ok("lun", "show", "vol1")
         self.assertRegex(text, r"(?m)^Size: +1\.5G \(1610612736 bytes\)$")
@@ -258,7 +258,8 @@ class Completion(Appliance):
         subprocess.run(["bash", "-n", self.script], check=True)
 
     def test_words_come_from_the_definitions(self):
-        self.assertEqual(self.complete(""), ["lun", "snapshot", "retention", "schedule", "events", "target", "completion"])
+        self.assertEqual(self.complete(""), ["lun", "snapshot", "retention", "schedule", "events", "target", "node", "vlun",
+                                             "replication", "login", "logout", "completion"])
         self.assertEqual(self.complete("lun", "un"), ["unmap", "unload"])
         self.assertEqual(self.complete("lun", "create", "--s"), ["--size"])
         self.assertEqual(self.complete("lun", "create", "--type", "t"), ["thin"])
