@@ -130,7 +130,7 @@ NORV_API int NORViSCSIIsSnapshotLocked(const _tag_iscsi_snapshot_ *snapshot, boo
 NORV_API int NORViSCSISnapshotLockedAppKeysGet(const _tag_iscsi_snapshot_ *snapshot, NLIBC_SZ_LIST *keys);
 
 /// Locks the snapshot against deletion under a key of at most 127 bytes, or takes that lock back;
-/// locking twice under one key is one lock.
+/// locking twice under one key is one lock, and taking back one that is not there no failure.
 NORV_API int NORViSCSISnapshotLockByAppKey(const _tag_iscsi_snapshot_ *snapshot, const char *key);
 NORV_API int NORViSCSISnapshotUnlockByAppKey(const _tag_iscsi_snapshot_ *snapshot, const char *key);
 

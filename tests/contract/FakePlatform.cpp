@@ -27,4 +27,14 @@ void Platform::addRetentionPolicy(int lid)
     fake::model().retention_policies.insert({"Lun#", std::to_string(lid)});
 }
 
+void Platform::unlock(const char *snapshot_uuid)
+{
+    for (auto &[place, snapshot] : fake::model().snapshots) {
+        if (std::string(snapshot.record.uuid) != snapshot_uuid)
+            continue;
+        snapshot.record.user_locked = 0;
+        snapshot.app_keys.clear();
+    }
+}
+
 } // namespace contract

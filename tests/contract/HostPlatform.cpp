@@ -3,6 +3,7 @@
 #include "iscsihost/host.h"
 #include "platform/iscsi_config.h"
 #include "platform/iscsi_lun.h"
+#include "platform/iscsi_snapshot.h"
 #include "platform/iscsi_target.h"
 
 #include <gtest/gtest.h>
@@ -120,8 +121,19 @@ void Platform::addScheduledSnapshots(int lid)
 void Platform::addRetentionPolicy(int lid)
 {
     iscsihost::RetentionPolicy policy;
-    policy.newest = 5;
+    policy.newest = 1;
     require(iscsihost::setRetentionPolicy(lid, policy), "setRetentionPolicy");
+}
+
+void Platform::unlock(const char *snapshot_uuid)
+{
+    require(iscsihost::setSnapshotUserLock(snapshot_uuid, false), "setSnapshotUserLock");
+    _tag_iscsi_snapshot_ snapshot{};
+    require(NORViSCSISnapshotConfGetByUUID(snapshot_uuid, &snapshot), "NORViSCSISnapshotConfGetByUUID");
+    const std::unique_ptr<NLIBC_SZ_LIST, decltype(&NLIBCSzListFree)> keys(NLIBCSzListAlloc(512), NLIBCSzListFree);
+    require(NORViSCSISnapshotLockedAppKeysGet(&snapshot, keys.get()), "NORViSCSISnapshotLockedAppKeysGet");
+    for (int i = 0; i < keys->count; ++i)
+        require(NORViSCSISnapshotUnlockByAppKey(&snapshot, NLIBCSzListGet(keys.get(), i)), "UnlockByAppKey");
 }
 
 } // namespace contract

@@ -19,7 +19,10 @@ public:
     /// Adds what the platform's functions only look up and remove.
     void addSnapshotTask(int lid, const std::string &lun_name);
     void addScheduledSnapshots(int lid);
-    void addRetentionPolicy(int lid);
+    void addRetentionPolicy(int lid); ///< keeps the newest snapshot
+
+    /// Takes the user's lock and the applications' from a snapshot, so that it can be deleted.
+    void unlock(const char *snapshot_uuid);
 
     std::string volume; ///< a location for LUNs, with room for a few small ones
     std::string folder; ///< for the platform's own files; empty

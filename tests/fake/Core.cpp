@@ -185,5 +185,5 @@ int NORVLogSet1(int scope, int level, unsigned int number, const char *text1, co
     char number_text[16];
     snprintf(number_text, sizeof(number_text), "0x%08x", number);
     return called(__func__, scope, level, number_text, shown(text1), shown(text2), shown(text3), shown(text4))
-        .value_or(0);
+        .value_or(level < 1 || level > 3 ? NORV_ERR_BAD_PARAMETER : 0);
 }

@@ -58,6 +58,8 @@ int setLoaded(const _tag_iscsi_snapshot_ *record, bool is_loaded)
     if (!snapshot)
         return NORV_ERR_NO_SUCH_SNAPSHOT;
     const uint32_t trash = record->flags & NORV_SNAPSHOT_TRASH;
+    if (is_loaded && !trash && snapshot->record.flags & NORV_SNAPSHOT_TRASH)
+        return NORV_ERR_SNAPSHOT_NOT_LOADED;
     snapshot->record.flags = is_loaded ? snapshot->record.flags & ~trash : snapshot->record.flags | trash;
     snapshot->is_loaded = is_loaded;
     if (!is_loaded)
@@ -157,7 +159,8 @@ int NORViSCSISnapshotUnlockByAppKey(const _tag_iscsi_snapshot_ *snapshot, const 
     Snapshot *known = byUUID(snapshot->uuid);
     if (!known)
         return NORV_ERR_NO_SUCH_SNAPSHOT;
-    return known->app_keys.erase(key) == 1 ? 0 : NORV_ERR_APP_KEY;
+    known->app_keys.erase(key);
+    return 0;
 }
 
 int NORViSCSIUnusedSnapshotNameFind(int lid, char *name, int size)
@@ -181,6 +184,10 @@ int NORViSCSISnapshotCreate(const _tag_iscsi_lun_ *lun, _tag_iscsi_snapshot_ *sn
     if (!known)
         return NORV_ERR_NO_SUCH_LUN;
     const int lid = known->record.lid;
+    if (known->record.type == NORV_LUN_TYPE_BLOCK || known->record.type == NORV_LUN_TYPE_FILE)
+        return NORV_ERR_LUN_TYPE;
+    if (known->record.options & NORV_LUN_OPTION_TRASH)
+        return NORV_ERR_LUN_NOT_LOADED;
     if (!isName(snapshot->name, sizeof(snapshot->name) - 1) || byName(lid, snapshot->name))
         return NORV_ERR_SNAPSHOT_NAME;
     const int number = freeNumber(lid);
@@ -220,10 +227,13 @@ int NORViSCSISnapshotRestore(const _tag_iscsi_snapshot_ *snapshot, const _tag_is
     if (auto failure = called(__func__, snapshot->uuid, lun->uuid))
         return *failure;
     const Snapshot *known = byUUID(snapshot->uuid);
-    const LUN *restored = findLUN(lun->uuid);
+    LUN *restored = findLUN(lun->uuid);
     if (!known || !restored || known->record.lid != restored->record.lid)
         return NORV_ERR_NO_SUCH_SNAPSHOT;
-    return restored->is_locked ? NORV_ERR_LUN_LOCKED : 0;
+    if (restored->is_locked)
+        return NORV_ERR_LUN_LOCKED;
+    restored->record.restored_time = 1700000000;
+    return 0;
 }
 
 int NORViSCSISnapshotLoad(const _tag_iscsi_snapshot_ *snapshot)
@@ -255,7 +265,11 @@ int NORViSCSILunClone(const _tag_iscsi_lun_ *source, _tag_iscsi_lun_ *clone)
 {
     if (auto failure = called(__func__, source->uuid, clone->name, clone->type, clone->location, clone->extent_size))
         return *failure;
-    return findLUN(source->uuid) ? createLUN(*clone) : NORV_ERR_NO_SUCH_LUN;
+    const LUN *known = findLUN(source->uuid);
+    if (!known)
+        return NORV_ERR_NO_SUCH_LUN;
+    clone->size = known->record.size;
+    return createLUN(*clone);
 }
 
 int NORViSCSILunWaitUntilUnlock(const _tag_iscsi_lun_ *lun, int limit)
@@ -281,6 +295,8 @@ int NORViSCSISnapshotExport(const _tag_iscsi_snapshot_ *snapshot, const char *de
     const Snapshot *known = byUUID(snapshot->uuid);
     if (!known)
         return NORV_ERR_NO_SUCH_SNAPSHOT;
+    if (*destination != '/')
+        return NORV_ERR_EXPORT_LOCATION;
     if (model().exports.count(destination) != 0)
         return NORV_ERR_FILE_EXISTS;
     _tag_iscsi_export_config_ &config = model().exports[destination];
@@ -300,7 +316,7 @@ int NORViSCSISnapshotExportCancel(const _tag_iscsi_snapshot_ *snapshot)
     if (!known)
         return NORV_ERR_NO_SUCH_SNAPSHOT;
     if (!known->is_locked)
-        return NORV_ERR_FILE_NOT_FOUND;
+        return NORV_ERR_NOT_EXPORTING;
     known->is_locked = false;
     return 0;
 }
@@ -325,7 +341,7 @@ int NORViSCSILunImportCancel(const _tag_iscsi_lun_ *lun)
     if (!known)
         return NORV_ERR_NO_SUCH_LUN;
     if (!known->is_locked)
-        return NORV_ERR_FILE_NOT_FOUND;
+        return NORV_ERR_NOT_IMPORTING;
     known->is_locked = false;
     return 0;
 }

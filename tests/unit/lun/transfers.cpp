@@ -52,7 +52,7 @@ TEST_F(Transfers, ExportStartsAndItsCancelWaits)
     EXPECT_EQ(lun.exportCancel(SNAPSHOT), 0);
     const std::string cancelled = "NORViSCSISnapshotExportCancel(" + SNAPSHOT + ")";
     EXPECT_EQ(called(), (Lines{loaded, cancelled, "NORViSCSISnapshotWaitUntilUnlock(" + SNAPSHOT + ", 180)"}));
-    EXPECT_EQ(lun.exportCancel(SNAPSHOT), 18990011) << "the platform's code";
+    EXPECT_EQ(lun.exportCancel(SNAPSHOT), 18990592) << "the platform's code";
     EXPECT_EQ(called(), (Lines{loaded, cancelled}));
 }
 
@@ -129,7 +129,7 @@ TEST_F(Transfers, ImportCancelWaits)
     fake::model().luns.at(lid).is_locked = true;
     EXPECT_EQ(lun.importCancel(), 0);
     EXPECT_EQ(called(), (Lines{lun_loaded, "NORViSCSILunImportCancel(" + uuidOf(lid) + ")", waited(180)}));
-    EXPECT_EQ(lun.importCancel(), 18990011);
+    EXPECT_EQ(lun.importCancel(), 18990593);
     EXPECT_EQ(called().size(), 2u);
 }
 
