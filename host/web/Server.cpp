@@ -36,7 +36,11 @@ std::string webapiFolder()
 {
     if (const char *named = getenv("ISCSI_HOST_WEBAPI"))
         return named;
-    return ISCSI_WEBAPI_FOLDER;
+    // An installed tree may have been moved as a whole.
+    std::error_code error;
+    const auto program = std::filesystem::read_symlink("/proc/self/exe", error);
+    const auto beside = program.parent_path().parent_path() / "libexec/iscsi-host/webapi";
+    return !error && access(beside.c_str(), X_OK) == 0 ? beside.string() : ISCSI_WEBAPI_FOLDER;
 }
 
 /// What the configuration takes from the environment: what differs between appliances on one machine. The server gives
