@@ -116,7 +116,7 @@ int iscsihost::beginReception(const std::string &task_uuid, const Incoming &inco
             return err;
     }
     if (int err = updateArrival(destination.task.record.uuid,
-                                {incoming.version, incoming.base, wordOf(begun.holding), begun.offset}))
+                                {incoming.version, incoming.base, wordOf(begun.holding), incoming.name, begun.offset}))
         return err;
     if (int err = writeTransferCount(destination.path, Transfer::sending, {0, 1}))
         return err;
@@ -165,7 +165,9 @@ int iscsihost::endReception(const std::string &task_uuid, const std::string &ver
         return err;
     if (int err = writeTransferCount(destination.path, Transfer::sending, {count.total, count.total}))
         return err;
-    return updateArrival(destination.task.record.uuid, {});
+    Arrival arrived;
+    arrived.name = destination.arrival.name;
+    return updateArrival(destination.task.record.uuid, arrived);
 }
 
 int iscsihost::arrivedBytes(const std::string &lun_uuid, uint64_t &bytes)

@@ -212,6 +212,7 @@ int Sender::send()
     Json::Value body(Json::objectValue), reception, answer;
     body["version"] = snapshot.record.version;
     body["base"] = base_file ? base.record.version : "";
+    body["name"] = snapshot.record.name;
     if (int err = api.call("POST", arrivalPath(), body, reception))
         return err;
     if (int err = describe(reception))

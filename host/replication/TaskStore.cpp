@@ -138,21 +138,24 @@ int stopRequested(std::string_view task_uuid, bool &stop)
 
 int loadArrival(std::string_view task_uuid, Arrival &arrival)
 {
-    Query query("SELECT arriving, arriving_base, arriving_on, arrived FROM replication_tasks WHERE uuid = ?1");
+    Query query(
+        "SELECT arriving, arriving_base, arriving_on, arriving_name, arrived FROM replication_tasks WHERE uuid = ?1");
     if (!query.bind(task_uuid).next())
         return query.error() ? query.error() : noSuchTask(task_uuid);
     arrival.version = query.text(0);
     arrival.base = query.text(1);
     arrival.holding = query.text(2);
-    arrival.offset = static_cast<uint64_t>(query.number(3));
+    arrival.name = query.text(3);
+    arrival.offset = static_cast<uint64_t>(query.number(4));
     return 0;
 }
 
 int updateArrival(std::string_view task_uuid, const Arrival &arrival)
 {
-    Query query("UPDATE replication_tasks SET arriving = ?2, arriving_base = ?3, arriving_on = ?4, arrived = ?5"
-                " WHERE uuid = ?1");
+    Query query("UPDATE replication_tasks SET arriving = ?2, arriving_base = ?3, arriving_on = ?4, arrived = ?5,"
+                " arriving_name = ?6 WHERE uuid = ?1");
     query.bind(task_uuid).bind(arrival.version).bind(arrival.base).bind(arrival.holding).bind(arrival.offset);
+    query.bind(arrival.name);
     return change(query, task_uuid);
 }
 

@@ -24,6 +24,7 @@ struct Arrival {
     std::string version; ///< of the state; empty for none
     std::string base;    ///< what the peer takes as its base
     std::string holding; ///< what the LUN held before: iscsihost::Holding in words
+    std::string name;    ///< of its snapshot on the peer
     uint64_t offset = 0; ///< bytes
 };
 

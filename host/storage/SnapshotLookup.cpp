@@ -147,7 +147,7 @@ int NORViSCSISnapshotUnlockByAppKey(const _tag_iscsi_snapshot_ *snapshot, const 
     return changeAppKey(snapshot, key, removeAppKey);
 }
 
-/// "<LUN name>-<number>".
+/// The peer's name for a state that arrived from it, else "<LUN name>-<number>".
 int NORViSCSIUnusedSnapshotNameFind(int lid, char *name, int size)
 {
     if (!name)
@@ -162,15 +162,25 @@ int NORViSCSIUnusedSnapshotNameFind(int lid, char *name, int size)
     std::vector<SnapshotRow> taken;
     if (int err = loadSnapshotsOfLun(lid, taken))
         return err;
+    const auto is_free = [&](const std::string &candidate) {
+        return std::none_of(taken.begin(), taken.end(),
+                            [&](const SnapshotRow &row) { return candidate == row.record.name; });
+    };
+    const auto choose = [name](const std::string &chosen) {
+        memcpy(name, chosen.c_str(), chosen.size() + 1);
+        return 0;
+    };
+    std::string arrived;
+    if (int err = loadArrivedName(lun.record.uuid, arrived))
+        return err;
+    if (!arrived.empty() && arrived.size() <= room && is_free(arrived))
+        return choose(arrived);
     const std::string begin = cutText(lun.record.name, room - number_room);
     // A deleted snapshot's name comes back as late as can be.
     for (size_t number = taken.size() + 1;; ++number) {
         const std::string candidate = begin + "-" + std::to_string(number);
-        if (std::none_of(taken.begin(), taken.end(),
-                         [&](const SnapshotRow &row) { return candidate == row.record.name; })) {
-            memcpy(name, candidate.c_str(), candidate.size() + 1);
-            return 0;
-        }
+        if (is_free(candidate))
+            return choose(candidate);
     }
 }
 

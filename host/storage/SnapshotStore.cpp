@@ -169,6 +169,17 @@ int findFreeLoadedNumber(int &number)
     return 0;
 }
 
+int loadArrivedName(std::string_view lun_uuid, std::string &name)
+{
+    Query query("SELECT arriving_name FROM replication_tasks WHERE dst_lun = ?1 AND NOT is_source");
+    std::string found;
+    if (query.bind(lun_uuid).next())
+        found = query.text(0);
+    if (!query.error())
+        name = found;
+    return query.error();
+}
+
 int insertSnapshot(const SnapshotRow &row)
 {
     const _tag_iscsi_snapshot_ &snapshot = row.record;

@@ -36,6 +36,9 @@ int loadSnapshotsOfLun(int lid, std::vector<SnapshotRow> &rows);
 /// The lowest number that the LUN has no snapshot under: NORV_ERR_MAX_SNAPSHOTS when there is none.
 int findFreeSnapshotId(int lid, int &snap_id);
 
+/// The name that the peer of a replication gave its snapshot of the state that arrived at the LUN last; empty for none.
+int loadArrivedName(std::string_view lun_uuid, std::string &name);
+
 /// The lowest of them that neither a loaded snapshot nor a LUN in any target has: NORV_ERR_MAX_SNAPSHOTS when there is
 /// none.
 int findFreeLoadedNumber(int &number);

@@ -71,7 +71,7 @@ class Replication(PairTest):
         there, data = self.replica()
         self.assertEqual(data, checksum("/tmp/source"))
         here = self.one.json("snapshot", "show", snapshot)
-        for fact in ("version", "description", "taken_by", "snapshot_time", "is_app_consistent", "is_user_locked", "total_size"):
+        for fact in ("name", "version", "description", "taken_by", "snapshot_time", "is_app_consistent", "is_user_locked", "total_size"):
             self.assertEqual(there[fact], here[fact], fact)
 
     def test_increments_and_failover(self):

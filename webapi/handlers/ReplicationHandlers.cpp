@@ -193,8 +193,9 @@ Result beginReception(const Request &request)
     return withTask(request, [&](ISCSILIBReplication &replication) {
         iscsihost::Reception reception;
         const Json::Value &in = request.input;
-        if (int err = iscsihost::beginReception(replication.task.uuid,
-                                                {in["version"].asString(), in["base"].asString()}, reception))
+        if (int err = iscsihost::beginReception(
+                replication.task.uuid, {in["version"].asString(), in["base"].asString(), in["name"].asString()},
+                reception))
             return failed(err);
         Result result;
         result.value["holding"] = reception.holding == iscsihost::Holding::zeros  ? "zeros"

@@ -11,6 +11,7 @@ namespace iscsihost {
 struct Incoming {
     std::string version; ///< UUID of the state
     std::string base;    ///< version that the peer takes as what the LUN holds; empty for none
+    std::string name;    ///< of the peer's snapshot, which the one that is taken here of the state shall have too
 };
 
 /// What the LUN holds instead of or besides the base.
