@@ -1,0 +1,1 @@
+../host/systemd/iscsi-host-schedule.cron
