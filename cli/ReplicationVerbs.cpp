@@ -128,6 +128,8 @@ Progress sendingProgress(const std::string &task)
     progress.running = told["is_locked"].asBool();
     progress.done = told["sent_size"].asUInt64();
     progress.total = told["send_total_size"].asUInt64();
+    if (progress.running && progress.done == progress.total)
+        progress.done = progress.total = 0; // the counts of the sending before
     const int error = told["error"].asInt();
     if (!progress.running && error != 0)
         throw Failure{error, error == STOPPED ? "it was stopped on purpose" : ""};
