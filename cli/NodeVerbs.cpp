@@ -130,7 +130,7 @@ void addJoin(Commands &commands, CLI::App &noun)
 {
     auto a = std::make_shared<Arguments>();
     auto account = std::make_shared<Account>();
-    CLI::App &verb = addVerb(commands, noun, "join", "Pair with another appliance", [a, account] {
+    CLI::App &verb = addVerb(commands, noun, "join", "Pair with another appliance, which takes it into this one's group", [a, account] {
         const auto address = parseAddress(a->selector);
         if (!address)
             throw UsageError{"'" + a->selector + "' is not HOST or HOST:PORT"};
@@ -150,7 +150,7 @@ void addJoin(Commands &commands, CLI::App &noun)
     addText(verb, "--fingerprint", "FINGERPRINT", a->input, "pin", FINGERPRINT_HELP);
     addYes(verb, a->yes);
     addJson(verb, a->json);
-    verb.footer("All appliances that either side is paired with come to know each other.");
+    verb.footer("All appliances that this one is paired with come to know the new one, too.");
 }
 
 void addRemove(Commands &commands, CLI::App &noun)
