@@ -76,15 +76,15 @@ class Served(Appliance):
 
     def serve(self):
         with open(os.path.join(self.folder, "web.log"), "ab") as log:
-            server = subprocess.Popen([ISCSI_HOST, "web", "run"], env=self.env, stderr=log)
-        self.addCleanup(server.wait)
-        self.addCleanup(server.send_signal, signal.SIGTERM)
+            self.server = subprocess.Popen([ISCSI_HOST, "web", "run"], env=self.env, stderr=log)
+        self.addCleanup(self.server.wait)
+        self.addCleanup(self.server.send_signal, signal.SIGTERM)
         deadline = time.monotonic() + 30
         while True:
             try:
                 return socket.create_connection((ADDRESS, 5443)).close()
             except ConnectionRefusedError:
-                if server.poll() is not None or time.monotonic() > deadline:
+                if self.server.poll() is not None or time.monotonic() > deadline:
                     with open(os.path.join(self.folder, "web.log"), encoding="utf-8") as text:
                         raise AssertionError(text.read()) from None
                 time.sleep(0.05)
