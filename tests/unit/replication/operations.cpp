@@ -4,6 +4,8 @@
 #include <filesystem>
 #include <functional>
 
+#include <unistd.h>
+
 namespace unit {
 namespace {
 
@@ -86,7 +88,11 @@ TEST_F(Replication, OnlyAWorkerWithoutTheLockExits)
     replication.childProcessExit();
     replication.is_child = true;
     replication.lock_fd = 99;
-    replication.childProcessExit();
+    const auto go_on = [this] {
+        replication.childProcessExit();
+        _exit(7);
+    };
+    EXPECT_EXIT(go_on(), testing::ExitedWithCode(7), "") << "it holds the lock";
     called();
     EXPECT_EQ(replication.forkProcessIfNotChild(), 0);
     EXPECT_EQ(called(), Lines()) << "a worker never forks again";
