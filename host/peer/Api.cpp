@@ -1,10 +1,12 @@
 /// Calls of the web API: requests whose answers are JSON.
 #include "host/core/LastError.h"
 #include "host/peer/Address.h"
+#include "host/peer/NodeApi.h"
 #include "iscsihost/https.h"
 #include "platform/error.h"
 
 #include <json/reader.h>
+#include <json/writer.h>
 #include <memory>
 #include <strings.h>
 
@@ -54,6 +56,24 @@ int failProblem(const std::string &server, const HttpsAnswer &answer)
 }
 
 } // namespace
+
+int askNode(const iscsihost::PairedNode &node, const char *method, const std::string &path, const Json::Value &input,
+            Json::Value &answer)
+{
+    iscsihost::HttpsRequest request;
+    request.host = node.host;
+    request.port = node.port;
+    request.protocol = node.protocol;
+    request.method = method;
+    request.path = "/api/v1" + path;
+    request.token = node.token;
+    request.pin = node.pin;
+    Json::StreamWriterBuilder compact;
+    compact["indentation"] = "";
+    request.body = Json::writeString(compact, input);
+    return iscsihost::callApi(request, answer);
+}
+
 } // namespace norvhost
 
 namespace iscsihost {

@@ -4,6 +4,7 @@
 #include "host/core/LastError.h"
 #include "host/core/Lock.h"
 #include "host/peer/Address.h"
+#include "host/peer/NodeApi.h"
 #include "host/replication/Difference.h"
 #include "host/state/Fields.h"
 #include "host/storage/LunStore.h"
@@ -11,7 +12,6 @@
 #include "host/storage/SnapshotStore.h"
 #include "host/target/Sinks.h"
 #include "host/transfer/PeerSink.h"
-#include "iscsihost/https.h"
 #include "iscsihost/node.h"
 #include "platform/core.h"
 #include "platform/dr_node.h"
@@ -22,7 +22,7 @@
 #include <chrono>
 #include <cstring>
 #include <iscsi/iscsi.h>
-#include <json/json.h>
+#include <json/value.h>
 #include <memory>
 #include <syslog.h>
 #include <thread>
@@ -31,7 +31,6 @@
 namespace norvhost {
 namespace {
 
-using iscsihost::HttpsRequest;
 using iscsihost::PairedNode;
 using Clock = std::chrono::steady_clock;
 
@@ -50,30 +49,6 @@ std::string textOf(const char *text)
 {
     return text ? text : "";
 }
-
-/// What is asked of the peer's web API.
-class PeerApi {
-public:
-    int open(const char *node_uuid) { return iscsihost::describePairedNode(node_uuid, node); }
-
-    int call(const char *method, const std::string &path, const Json::Value &body, Json::Value &answer) const
-    {
-        HttpsRequest request;
-        request.host = node.host;
-        request.port = node.port;
-        request.protocol = node.protocol;
-        request.token = node.token;
-        request.method = method;
-        request.path = "/api/v1" + path;
-        Json::StreamWriterBuilder builder;
-        builder["indentation"] = "";
-        request.body = Json::writeString(builder, body);
-        return iscsihost::callApi(request, answer);
-    }
-
-private:
-    PairedNode node;
-};
 
 /// The peer's sink, open until the object ends.
 class OpenSink {
@@ -138,7 +113,7 @@ private:
     TaskRow task;
     SnapshotRow snapshot, base;
     FileDescriptor file, base_file;
-    PeerApi api;
+    PairedNode peer;
     std::vector<DataRange> ranges;
     uint64_t total = 0, moved_before = 0, offset = 0;
     bool to_zeros = false;
@@ -190,7 +165,7 @@ int Sender::prepare(const _tag_iscsi_task_ &wanted, const char *snapshot_uuid, c
         if (int err = openSnapshotData(base.record, base_file))
             return err;
     }
-    if (int err = api.open(task.remoteNode()))
+    if (int err = iscsihost::describePairedNode(task.remoteNode(), peer))
         return err;
     if (int err = requestStop(task.record.uuid, false))
         return err;
@@ -213,7 +188,7 @@ int Sender::send()
     body["version"] = snapshot.record.version;
     body["base"] = base_file ? base.record.version : "";
     body["name"] = snapshot.record.name;
-    if (int err = api.call("POST", arrivalPath(), body, reception))
+    if (int err = askNode(peer, "POST", arrivalPath(), body, reception))
         return err;
     if (int err = describe(reception))
         return err;
@@ -226,7 +201,7 @@ int Sender::send()
         return err;
     Json::Value end(Json::objectValue);
     end["version"] = snapshot.record.version;
-    if (int err = api.call("POST", arrivalPath() + "/end", end, answer))
+    if (int err = askNode(peer, "POST", arrivalPath() + "/end", end, answer))
         return err;
     task.progress.sent_size = task.progress.send_total_size = total;
     task.progress.progress_value = 100;
@@ -299,7 +274,7 @@ int Sender::note(uint64_t flushed)
     body["offset"] = Json::UInt64(flushed);
     body["moved"] = Json::UInt64(moved_before);
     body["total"] = Json::UInt64(total);
-    if (int err = api.call("PATCH", arrivalPath(), body, answer))
+    if (int err = askNode(peer, "PATCH", arrivalPath(), body, answer))
         return err;
     return tell(0);
 }

@@ -1,21 +1,18 @@
 #include "host/transfer/PeerSink.h"
 
 #include "host/core/LastError.h"
+#include "host/peer/NodeApi.h"
 #include "host/target/Sinks.h"
-#include "iscsihost/https.h"
-#include "iscsihost/node.h"
 #include "platform/dr_node.h"
 #include "platform/error.h"
 #include "platform/extent_pool.h"
 
 #include <algorithm>
 #include <json/value.h>
-#include <json/writer.h>
 
 namespace norvhost {
 namespace {
 
-using iscsihost::HttpsRequest;
 using iscsihost::PairedNode;
 using iscsihost::Sink;
 
@@ -23,18 +20,7 @@ using iscsihost::Sink;
 int ask(const PairedNode &node, const std::string &lun_uuid, const char *what, const Json::Value &input,
         Json::Value &answer)
 {
-    HttpsRequest request;
-    request.host = node.host;
-    request.port = node.port;
-    request.protocol = node.protocol;
-    request.method = "POST";
-    request.path = "/api/v1/sinks/" + lun_uuid + "/" + what;
-    request.token = node.token;
-    request.pin = node.pin;
-    Json::StreamWriterBuilder compact;
-    compact["indentation"] = "";
-    request.body = Json::writeString(compact, input);
-    return iscsihost::callApi(request, answer);
+    return askNode(node, "POST", "/sinks/" + lun_uuid + "/" + what, input, answer);
 }
 
 /// The node is another appliance: what it answers is looked at before it is used.
