@@ -26,7 +26,7 @@ namespace fs = std::filesystem;
 
 constexpr char ROOT[] = "/api/v1";
 constexpr int UNAUTHORIZED = 401;
-constexpr int LONGEST_SILENCE_SECONDS = 600; ///< some requests answer when their work is done
+constexpr int LONGEST_SILENCE_SECONDS = 900; ///< as long as the server waits for the program that answers
 
 std::string variable(const char *name)
 {
