@@ -59,6 +59,17 @@ class PairTest(unittest.TestCase):
         cls.one.power_off()
         cls.two.power_off()
 
+    def run(self, result=None):
+        """What the machines logged explains a failure."""
+        def bad():
+            return len(result.failures) + len(result.errors)
+        before, said = bad(), [(machine, len(machine.log_lines)) for machine in (self.one, self.two)]
+        outcome = super().run(result)
+        if bad() > before:
+            for machine, lines in said:
+                print(f"--- log of {machine.name}", *machine.log_lines[lines:][-60:], sep="\n", file=sys.stderr)
+        return outcome
+
     def refused(self, appliance, *command, says, **options):
         result = appliance.run("iscsictl", *command, check=False, **options)
         self.assertEqual((result.returncode, result.stdout), (1, ""), (command, result.stderr))
