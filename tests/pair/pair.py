@@ -16,6 +16,7 @@ import time
 
 HERE = os.path.dirname(os.path.abspath(__file__))
 MACHINES = "/run/world/machines"  # NAME -> the process to enter the machine by
+DISKS = "/run/world/disks"  # NAME -> what the machine keeps when it is off
 BRIDGE, BRIDGE_ADDRESS = "lan", "192.0.2.1"
 VOLUME = "/mnt/volume1"
 ACCOUNT = "admin"
@@ -50,25 +51,43 @@ def wait_until(true, what, seconds=20):
         time.sleep(0.02)
 
 
+def is_alive(pid):
+    """Whether there is such a process, and it is not merely waiting to be forgotten."""
+    try:
+        with open(f"/proc/{pid}/stat", encoding="utf-8") as stat:
+            return stat.read().rpartition(")")[2].split()[0] not in "ZX"
+    except (FileNotFoundError, ProcessLookupError):
+        return False
+
+
 class Machine:
     """A machine with nothing running on it, plugged into the bridge."""
 
     def __init__(self, name, address):
         self.name, self.address = name, address
+        self.disk = f"{DISKS}/{name}"
+        self.log_lines = []
+        os.makedirs(self.disk, exist_ok=True)
+        run("umount", "--quiet", self.disk, check=False)  # of an earlier machine of the name
+        run("mount", "-t", "tmpfs", "-o", "mode=0755", "tmpfs", self.disk)
+        self.power_on()
+
+    def power_on(self):
         self.holder = subprocess.Popen(
             ["unshare", "--mount", "--uts", "--ipc", "--net", "--pid", "--fork", "--kill-child", "--mount-proc",
-             f"{HERE}/machine.sh", name], stdin=subprocess.PIPE, stdout=subprocess.PIPE, text=True, start_new_session=True)
+             f"{HERE}/machine.sh", self.name, self.disk],
+            stdin=subprocess.PIPE, stdout=subprocess.PIPE, text=True, start_new_session=True)
         self._expect("made")
         with open(f"/proc/{self.holder.pid}/task/{self.holder.pid}/children", encoding="ascii") as children:
             self.pid = int(children.read())
         self.environment = {key: value for key, value in os.environ.items() if not key.startswith("ISCSI_HOST_")}
         self._plug_in()
-        self.holder.stdin.write(address + "\n")
+        self.holder.stdin.write(self.address + "\n")
         self.holder.stdin.flush()
         self._expect("ready")
         self._take_log()
         os.makedirs(MACHINES, exist_ok=True)
-        with open(f"{MACHINES}/{name}", "w", encoding="ascii") as file:
+        with open(f"{MACHINES}/{self.name}", "w", encoding="ascii") as file:
             file.write(f"{self.pid}\n")
 
     def _expect(self, word):
@@ -80,11 +99,11 @@ class Machine:
             run("ip", "link", "add", BRIDGE, "type", "bridge")
             run("ip", "address", "add", f"{BRIDGE_ADDRESS}/24", "dev", BRIDGE)
             run("ip", "link", "set", BRIDGE, "up")
-        run("ip", "link", "add", self.name, "type", "veth", "peer", "name", "eth0", "netns", str(self.pid))
+        card = "02:00:00:00:00:%02x" % int(self.address.rpartition(".")[2])  # the same after a restart
+        run("ip", "link", "add", self.name, "type", "veth", "peer", "name", "eth0", "address", card, "netns", str(self.pid))
         run("ip", "link", "set", self.name, "master", BRIDGE, "up")
 
     def _take_log(self):
-        self.log_lines = []
         receiver = socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM)
         receiver.bind(f"/proc/{self.pid}/root/dev/log")
 
@@ -95,9 +114,11 @@ class Machine:
         threading.Thread(target=take, daemon=True).start()
 
     def power_off(self):
-        """The machine and everything on it is gone, at once."""
+        """The machine and everything on it is gone, at once; its disk stays."""
+        run("ip", "link", "delete", self.name, check=False)
         self.holder.kill()
         self.holder.wait()
+        wait_until(lambda: not is_alive(self.pid), f"{self.name} is off")
         self.holder.stdin.close()
         self.holder.stdout.close()
         os.unlink(f"{MACHINES}/{self.name}")
@@ -112,14 +133,13 @@ class Machine:
         """A program in the background: subprocess.Popen with output as text."""
         return subprocess.Popen(self.entering(*command), env=self.environment, text=True, errors="replace", **options)
 
-    def processes(self, name):
-        """Process IDs, as the world sees them, of the machine's processes of this name."""
+    def processes(self, name=None):
+        """Process IDs, as the world sees them, of the machine's processes of this name, or of all."""
         space, found = os.readlink(f"/proc/{self.pid}/ns/pid"), []
         for entry in filter(str.isdigit, os.listdir("/proc")):
             try:
-                with open(f"/proc/{entry}/comm", encoding="utf-8") as comm, open(f"/proc/{entry}/stat", encoding="utf-8") as stat:
-                    alive = stat.read().rpartition(")")[2].split()[0] not in "ZX"
-                    if comm.read().strip() == name and alive and os.readlink(f"/proc/{entry}/ns/pid") == space:
+                with open(f"/proc/{entry}/comm", encoding="utf-8") as comm:
+                    if name in (None, comm.read().strip()) and is_alive(entry) and os.readlink(f"/proc/{entry}/ns/pid") == space:
                         found.append(int(entry))
             except (FileNotFoundError, ProcessLookupError):
                 pass
@@ -149,9 +169,29 @@ class Appliance(Machine):
         self.host("portal", "set", address)
         self.host("volume", "create", VOLUME, "--size", volume_size)
         self.host("account", "add", ACCOUNT, "--role", "admin", "--password-file", "-", stdin=self.password + "\n")
+        self.boot()
+
+    def boot(self):
         self.host("boot")
         self.supervisor = self._serve("iscsi-host", "run")
         self.start_web()
+
+    def restart(self):
+        """The power fails, and comes back: what was not flushed to the volume is lost."""
+        stays = self.processes("sleep") + [self.pid]
+
+        def nothing_runs():
+            killed = [pid for pid in self.processes() if pid not in stays]
+            for pid in killed:
+                os.kill(pid, signal.SIGKILL)
+            return not killed
+
+        wait_until(nothing_runs, f"nothing runs on {self.name}")
+        self.run("xfs_io", "-x", "-c", "shutdown", VOLUME)
+        self.run("umount", VOLUME)
+        self.power_off()
+        self.power_on()
+        self.boot()
 
     def _serve(self, *command):
         """A program that runs in the foreground, as a service manager would start it."""
