@@ -62,6 +62,8 @@ const char *hint(int code)
     case ISCSI::ERR_FAILED_TO_LOGIN:
         return cli::remote() ? nullptr
                              : "a node that has forgotten this appliance is removed and joined again: 'iscsictl node'";
+    case ISCSI::ERR_FAILED_TO_SEND_THE_REQUEST:
+        return cli::remote() ? "'login' shows a key that is new or has changed, and asks about it" : nullptr;
     case ISCSI::ERR_BAD_VLUN_UUID:
         return "'iscsictl vlun list' shows the virtual LUNs";
     case ISCSI::ERR_LUN_IS_MAPPED:
