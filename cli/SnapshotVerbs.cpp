@@ -38,7 +38,9 @@ void printSnapshot(const Json::Value &snapshot, bool json, const char *done)
 {
     if (json)
         return printJson(snapshot);
-    print(std::string(done) + " snapshot " + shown(nameOf(snapshot)) + ": " + snapshot["uuid"].asString() + "\n");
+    const int number = snapshot["loaded_number"].asInt();
+    print(std::string(done) + " snapshot " + shown(nameOf(snapshot)) + ": " + snapshot["uuid"].asString() +
+          (number ? ", read as LUN " + std::to_string(number) + " of the LUN's targets" : "") + "\n");
 }
 
 /// How far the action is that locks the LUN.
@@ -135,6 +137,7 @@ void printDetails(const Json::Value &snapshot)
         {"Applications quiet", yesNo(snapshot["is_app_consistent"])},
         {"Locked", locksOf(snapshot)},
         {"In use by an action", yesNo(snapshot["is_action_locked"])},
+        {"Loaded as LUN", snapshot["loaded_number"].asInt() ? snapshot["loaded_number"].asString() : "-"},
         {"Status", snapshot["status"].asString()},
         {"Volume", snapshot["root_path"].asString()},
     }));

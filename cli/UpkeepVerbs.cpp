@@ -8,6 +8,7 @@
 #include <json/writer.h>
 
 #include <chrono>
+#include <cstring>
 #include <thread>
 
 namespace cli {
@@ -116,6 +117,13 @@ void printSchedules(const Json::Value &schedules)
     print(table.text());
 }
 
+/// Whether the text has the form of an interval, "15m"; what it may be is the platform's to judge.
+bool isInterval(const std::string &text)
+{
+    const size_t digits = text.find_first_not_of("0123456789");
+    return digits != 0 && digits != text.npos && digits + 1 == text.size() && strchr("mhdw", text[digits]);
+}
+
 void addSchedules(Commands &commands)
 {
     CLI::App &noun = addNoun(commands, "schedule", "When snapshots are taken by themselves");
@@ -132,9 +140,15 @@ void addSchedules(Commands &commands)
     });
     addText(add_verb, "--lun", "LUN", add->input, "lun", "The LUN").required();
     CLI::Option &every = addText(add_verb, "--every", "INTERVAL", add->input, "rule", "Interval: 15m, 1h, 2d, 1w");
+    every.check([](const std::string &text) {
+        return isInterval(text) ? "" : "'" + text + "' is no interval as 15m, 1h, 2d and 1w are; --cron takes times";
+    });
     addText(add_verb, "--cron", "TEXT", add->input, "rule",
             "Minute, hour, day of the month, month and day of the week as in crontab, or a word: daily")
-        .excludes(&every);
+        .excludes(&every)
+        ->check([](const std::string &text) {
+            return isInterval(text) ? "'" + text + "' is an interval, which --every takes" : "";
+        });
     addJson(add_verb, add->json);
 
     auto list = std::make_shared<Arguments>();

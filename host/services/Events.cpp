@@ -35,6 +35,7 @@ const struct {
     {0x13d0000b, "The snapshot of %2 of the LUN %3 was cloned to the LUN %1."},
     {0x13d0000c, "The snapshot of %2 of the LUN %3 could not be cloned to the LUN %1."},
     {0x13d0000d, "The snapshot of the LUN %1 on the destination of its replication could not be taken: %2."},
+    {scheduled_snapshot_failed, "The scheduled snapshot of the LUN %1 could not be taken: %2."},
 };
 
 std::string filledIn(const char *sentence, const Texts &texts)

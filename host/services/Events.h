@@ -5,6 +5,9 @@
 
 namespace norvhost {
 
+/// An event of this platform's own, above the numbers of the snapshot family that its callers use.
+constexpr unsigned scheduled_snapshot_failed = 0x13d000f1;
+
 /// Older events go when newer ones come.
 constexpr int64_t kept_events = 10000;
 

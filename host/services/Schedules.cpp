@@ -2,10 +2,12 @@
 
 #include "host/core/LastError.h"
 #include "host/core/Process.h"
+#include "host/services/Events.h"
 #include "host/services/ScheduleRule.h"
 #include "host/state/Database.h"
 #include "host/storage/LunStore.h"
 #include "platform/error.h"
+#include "platform/event_log.h"
 #include "platform/iscsi_lun.h"
 #include "platform/schedule.h"
 
@@ -172,6 +174,9 @@ int runDueSchedules(std::vector<iscsihost::ScheduleRun> &runs)
     for (const iscsihost::Schedule &schedule : due) {
         const int err = takeSnapshot(schedule);
         runs.push_back({schedule, err, err ? lastError() : ""});
+        if (err)
+            NORVLogSet1(9, 3, scheduled_snapshot_failed, schedule.lun_name.c_str(), runs.back().reason.c_str(), nullptr,
+                        nullptr);
         if (!first)
             first = err;
     }

@@ -4,6 +4,7 @@ import glob
 import json
 import os
 import pty
+import pwd
 import re
 import signal
 import subprocess
@@ -61,18 +62,19 @@ class Snapshots(Appliance):
         self.assertEqual(self.list(), [])
         self.write(b"1")
         one = self.take("--name", "one", "--note", "größe\x1b[2J", "--taken-by", "me", "--app-consistent")
-        self.assertEqual(set(one), KEYS | {"sync_progress"})
+        self.assertEqual(set(one), KEYS | {"sync_progress", "loaded_number"})
         self.assertEqual({key: one[key] for key in ("name", "lun_name", "description", "taken_by", "is_app_consistent",
                                                     "is_user_locked", "total_size", "mapped_size", "locked_app_keys")},
                          {"name": "one", "lun_name": "vm", "description": "größe\x1b[2J", "taken_by": "me",
                           "is_app_consistent": True, "is_user_locked": False, "total_size": 16 * MIB,
                           "mapped_size": 4 * MIB, "locked_app_keys": []})
         two = json.loads(self.ok("snapshot", "take", "vm", "--json", "--lock"))
+        self.assertEqual(two["taken_by"], pwd.getpwuid(os.geteuid()).pw_name)
         self.create("other")
         self.take("--name", "one", lun="other")
         self.assertEqual([(s["lun_name"], s["name"]) for s in self.list()],
                          [("vm", "one"), ("vm", two["name"]), ("other", "one")])
-        self.assertEqual([snapshot | {"sync_progress": 0} for snapshot in self.list("vm")], [one, two])
+        self.assertEqual([snapshot | {"sync_progress": 0, "loaded_number": 0} for snapshot in self.list("vm")], [one, two])
         text = self.ok("snapshot", "show", "vm_one")
         self.assertIn(r"größe\x1b[2J", text)
         self.assertNotIn("Export:", text)
@@ -93,6 +95,10 @@ class Snapshots(Appliance):
         self.assertRegex(self.ok("snapshot", "list"), r"(?m)^1 +vm +one .* backup +me ")
         self.fails(1, "snapshot", "delete", "--yes", "vm_one", says=r"Snapshot is locked \(18990547\): .*'backup'")
         self.ok("snapshot", "unlock", "vm_one", "--app-key", "backup")
+
+        number = re.search(r"^Loaded snapshot one .*, read as LUN (\d+) of", self.ok("snapshot", "load", "vm_one"))[1]
+        self.assertRegex(self.ok("snapshot", "show", "vm_one"), rf"(?m)^Loaded as LUN:? +{number}$")
+        self.assertNotIn("LUN " + number, self.ok("snapshot", "unload", "vm_one"))
 
         self.write(b"2")
         self.fails(2, "snapshot", "restore", "vm_one", says="--yes")
@@ -218,10 +224,16 @@ class Snapshots(Appliance):
     def test_schedules(self):
         self.fails(2, "schedule", "add", "--lun", "vm", says="--every or --cron")
         self.fails(2, "schedule", "add", "--lun", "vm", "--every", "1h", "--cron", "daily", says="--cron")
+        self.fails(2, "schedule", "add", "--lun", "vm", "--every", "daily", says="--every: 'daily' is no interval.*--cron")
+        self.fails(2, "schedule", "add", "--lun", "vm", "--cron", "1h", says="--cron: '1h' is an interval.*--every")
         self.fails(1, "schedule", "add", "--lun", "vm", "--cron", "61 * * * *", says=r"\(18990004\): minute: ")
         added = json.loads(self.ok("schedule", "add", "--lun", "vm", "--cron", "*/5 * * * *", "--json"))
         self.assertEqual((added["lun_name"], added["kind"], added["rule"], added["next_run"] % 300, added["last_run"]),
                          ("vm", "snapshot", "*/5 * * * *", 0, 0))
+        self.assertEqual(json.loads(self.ok("schedule", "list", "--json")), [added])
+        self.take("--name", "kept", "--lock")
+        refused = r"Cannot delete locked snapshot \(18990540\): its snapshot 'kept' .* by its user\n.*snapshot unlock"
+        self.fails(1, "lun", "delete", "vm", "--yes", says=refused)
         self.assertEqual(json.loads(self.ok("schedule", "list", "--json")), [added])
         for bad in ("x", "", "-", "99", "1" * 30, str(added["schedule_id"]) + "x"):
             self.fails(1, "schedule", "remove", "--", bad, says=r"\(18990004\)")

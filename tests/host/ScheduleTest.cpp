@@ -281,6 +281,11 @@ TEST_F(ScheduleTest, RunsTheCommandForEachDueJob)
     ASSERT_EQ(2u, runs.size()) << "the failure of one does not keep the other from running";
     EXPECT_EQ("out of space", runs[0].reason);
     EXPECT_EQ(0, runs[1].code);
+    std::vector<iscsihost::Event> events;
+    ASSERT_EQ(0, iscsihost::listEvents(0, 9, events));
+    ASSERT_EQ(1u, events.size());
+    EXPECT_EQ(3, events[0].level);
+    EXPECT_EQ("The scheduled snapshot of the LUN bad could not be taken: out of space.", events[0].message);
     std::string said;
     std::getline(std::ifstream(log), said);
     const std::string rest = "><--scheduled><--taken-by><schedule>";

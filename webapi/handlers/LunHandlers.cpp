@@ -34,6 +34,23 @@ void addAllocatedSize(ISCSILUNInfo &lun, _tag_iscsi_lun_ &record, Json::Value &o
         out.removeMember("allocated_size");
 }
 
+/// Tells which lock on one of the LUN's snapshots keeps it from being deleted, if any.
+Result refuseLockedSnapshots(ISCSILIBLUN &lun)
+{
+    std::vector<ISCSISnapshotInfo> snapshots;
+    if (int err = lun.listSnapshot(snapshots, ISCSISnapshotInfo::LOAD_LOCKED_APP_KEYS))
+        return failed(err);
+    for (const ISCSISnapshotInfo &snapshot : snapshots) {
+        const std::string which = "its snapshot '" + snapshot.name + "' (" + snapshot.uuid + ") is locked by ";
+        if (snapshot.is_user_locked)
+            return failed(ERR_CANNOT_DELETE_LOCKED_SNAPSHOT, which + "its user");
+        if (!snapshot.locked_app_keys.empty())
+            return failed(ERR_SNAPSHOT_IS_LOCKED,
+                          which + "the application key '" + *snapshot.locked_app_keys.begin() + "'");
+    }
+    return {};
+}
+
 /// The LUN's JSON form with all live state, "sync_progress", and "targets": where it is mapped.
 Result describe(const std::string &uuid)
 {
@@ -182,6 +199,8 @@ Result deleteLun(const Request &request)
         return failed(ERR_LUN_IS_MAPPED, "");
     if (lun.info.is_action_locked)
         return failed(ERR_LUN_IS_LOCKED, "another action is at work on it");
+    if (Result bad = refuseLockedSnapshots(lun); bad.code)
+        return bad;
     if (int err = lun.deleteLUN())
         return failed(err);
     return {};

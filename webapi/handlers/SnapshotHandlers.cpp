@@ -4,6 +4,9 @@
 #include "iscsiwebapi/ISCSIErrorCode.h"
 #include "iscsiwebapi/ISCSILIBLUN.h"
 
+#include <pwd.h>
+#include <unistd.h>
+
 #include <ctime>
 #include <map>
 
@@ -16,7 +19,7 @@ namespace {
 
 constexpr int ALL_FACTS = ISCSISnapshotInfo::LOAD_ACTION_LOCK | ISCSISnapshotInfo::LOAD_LOCKED_APP_KEYS;
 
-/// The snapshot's JSON form with its lock facts, and "lun_name".
+/// The snapshot's JSON form with its lock facts, "lun_name", "sync_progress" and "loaded_number".
 Result describe(const std::string &uuid)
 {
     ISCSISnapshotInfo snapshot(uuid);
@@ -36,6 +39,10 @@ Result describe(const std::string &uuid)
     if (int err = snapshot.loadSyncProgress(done, total))
         return failed(err);
     result.value["sync_progress"] = static_cast<Json::UInt64>(done < total ? done : 0);
+    int loaded_number = 0;
+    if (int err = iscsihost::snapshotLunNumber(uuid, loaded_number))
+        return failed(err);
+    result.value["loaded_number"] = loaded_number;
     return result;
 }
 
@@ -53,13 +60,21 @@ Result changeSnapshot(const Request &request, Act act)
     return describe(snapshot.uuid);
 }
 
-/// Who is said to act: whom the request names, else the session's account; empty, for the library's default, in a
-/// process of the machine's own.
+/// The name of the machine's user that this process belongs to, or the number of one without a name.
+std::string userName()
+{
+    const passwd *user = getpwuid(geteuid());
+    return user ? user->pw_name : std::to_string(geteuid());
+}
+
+/// Who is said to act: whom the request names, else the session's account, or the machine's user without a session.
 std::string actor(const Request &request, const char *field)
 {
     constexpr size_t ACTOR_MAX_BYTES = 31; // what fits the SDK's record
     const std::string named = request.input[field].asString();
-    return named.empty() && !request.token.empty() ? request.account.substr(0, ACTOR_MAX_BYTES) : named;
+    if (!named.empty())
+        return named;
+    return (request.token.empty() ? userName() : request.account).substr(0, ACTOR_MAX_BYTES);
 }
 
 /// The lock of the user, or of an application when the request names its key.
