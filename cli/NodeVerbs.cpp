@@ -130,7 +130,7 @@ void addJoin(Commands &commands, CLI::App &noun)
 {
     auto a = std::make_shared<Arguments>();
     auto account = std::make_shared<Account>();
-    CLI::App &verb = addVerb(commands, noun, "join", "Pair with another appliance, which takes it into this one's group", [a, account] {
+    CLI::App &verb = addVerb(commands, noun, "join", "Take another appliance into the group of this one", [a, account] {
         const auto address = parseAddress(a->selector);
         if (!address)
             throw UsageError{"'" + a->selector + "' is not HOST or HOST:PORT"};
