@@ -7,6 +7,7 @@
 #include "host/storage/Restore.h"
 #include "host/storage/Sweep.h"
 #include "host/storage/Transfers.h"
+#include "host/target/Exports.h"
 #include "platform/error.h"
 
 #include <bitset>
@@ -26,9 +27,16 @@ int checkNameFree(const char *name)
     return err == NORV_ERR_NO_SUCH_LUN ? 0 : err;
 }
 
+/// Held while IDs are tried, and while a row is stored: an ID that another creator has just stored would be locked here
+/// for a moment, and what its owner does next with the new LUN would be refused.
+constexpr const char *id_lock = "lun-ids";
+
 /// Finds a LUN ID that has neither row nor action, and locks it for the creation.
 int reserveLunId(LunLock &lock, int action, int &lid)
 {
+    NamedLock alone;
+    if (int err = alone.take(id_lock))
+        return err;
     std::bitset<NORV_LUN_ID_MAX + 1> used;
     if (int err = forEachLun([&](const LunRow &row) { used.set(static_cast<size_t>(row.record.lid)); }))
         return err;
@@ -36,20 +44,18 @@ int reserveLunId(LunLock &lock, int action, int &lid)
         if (used.test(static_cast<size_t>(lid)))
             continue;
         const int err = lock.take(lid, action);
-        if (err == NORV_ERR_LUN_LOCKED)
-            continue;
-        if (err)
+        if (err != NORV_ERR_LUN_LOCKED)
             return err;
-        // Another creator may have come and gone since the rows were read.
-        LunRow row;
-        const int missing = loadLunByLid(lid, row);
-        if (missing == NORV_ERR_NO_SUCH_LUN)
-            return 0;
-        lock.release();
-        if (missing)
-            return missing;
     }
     return fail(NORV_ERR_MAX_LUNS, "there are %d LUNs, those being created included: more cannot be", NORV_LUN_ID_MAX);
+}
+
+int insertNewLun(const LunRow &row)
+{
+    NamedLock alone;
+    if (int err = alone.take(id_lock))
+        return err;
+    return insertLun(row);
 }
 
 } // namespace
@@ -81,11 +87,8 @@ int lockLun(const _tag_iscsi_lun_ *lun, int action, LunLock &lock, LunRow &row)
         return err;
     if (int err = lockLun(found.record.lid, action, lock, row))
         return err;
-    bool open;
-    if (int err = isSinkOpen(row.record.lid, open))
+    if (int err = refuseOpenSink(row.record.lid))
         return err;
-    if (open)
-        return fail(NORV_ERR_LUN_LOCKED, "a peer is writing to the LUN '%s'", row.record.name);
     // Between the two reads another LUN may have got the ID.
     return row.record.uuid == std::string_view(found.record.uuid) ? 0 : loadLunByUuid(lun->uuid, row);
 }
@@ -106,7 +109,7 @@ int addLun(LunRow &row, int action, LunLock &lock, const std::function<int(const
     snprintf(row.record.uuid, sizeof row.record.uuid, "%s", newUuid().c_str());
     if (int err = make_data(row))
         return err;
-    if (int err = insertLun(row)) {
+    if (int err = insertNewLun(row)) {
         if (!isBlock(row.record.type))
             unlink(dataPath(row.record).c_str());
         return err;

@@ -6,6 +6,7 @@
 #include "host/state/Database.h"
 
 #include <chrono>
+#include <cstdio>
 #include <poll.h>
 #include <random>
 #include <sys/wait.h>
@@ -92,15 +93,24 @@ TEST_F(KillTest, MoveToTheTrashKilledAtEverySystemCall)
 TEST_F(KillTest, RandomKillsOfManyWorkers)
 {
     std::mt19937 random(std::random_device{}());
-    const auto busy = [this](int worker) {
+    const auto act = [this](const std::string &name, int i) {
+        _tag_iscsi_lun_ lun = wanted(name, i % 2 ? NORV_LUN_TYPE_ADV : NORV_LUN_TYPE_FILE, MiB);
+        if (int err = NORViSCSILunCreate(&lun))
+            return err;
+        if (int err = update(lun, name + "-renamed", 2 * MiB))
+            return err;
+        lun.options = NORV_LUN_OPTION_TRASH;
+        if (int err = NORViSCSILunUnload(&lun))
+            return err;
+        return i % 3 ? NORViSCSILunDelete(&lun) : 0;
+    };
+    const auto busy = [&](int worker) {
         for (int i = 0;; ++i) {
             const std::string name = "lun-" + std::to_string(worker) + "-" + std::to_string(i);
-            _tag_iscsi_lun_ lun = wanted(name, i % 2 ? NORV_LUN_TYPE_ADV : NORV_LUN_TYPE_FILE, MiB);
-            if (NORViSCSILunCreate(&lun) != 0 || update(lun, name + "-renamed", 2 * MiB) != 0)
+            if (int err = act(name, i)) {
+                fprintf(stderr, "%s: %d: %s\n", name.c_str(), err, iscsi_host_last_error());
                 return 1;
-            lun.options = NORV_LUN_OPTION_TRASH;
-            if (NORViSCSILunUnload(&lun) != 0 || (i % 3 && NORViSCSILunDelete(&lun) != 0))
-                return 2;
+            }
         }
     };
     for (int round = 0; round < 50 && !HasFailure(); ++round) {
