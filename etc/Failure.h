@@ -15,6 +15,8 @@
 
 namespace ISCSI {
 
+class ISCSINodeInfo;
+
 /// A place in the source, as it stands at the head of a log line.
 struct Site {
     const char *file; ///< relative to the source root
@@ -40,11 +42,19 @@ int failTagged(Site site, int code, const std::string &detail);
 
 int failStandard(Site site, int code, const char *sentence, const std::string &info);
 
+/// A record as it stands in a log line: its text form, of a node with its secrets as "***".
+template <class Record>
+std::string logText(const Record &record)
+{
+    return record.toString();
+}
+std::string logText(const ISCSINodeInfo &node);
+
 /// The standard form: the sentence, then ". info: %s. error: %d (%s)" of the record and the code.
 template <class Record>
 int fail(int code, const Record &record, const char *sentence, Site site = here())
 {
-    return failStandard(site, code, sentence, record.toString());
+    return failStandard(site, code, sentence, logText(record));
 }
 
 } // namespace ISCSI

@@ -122,7 +122,7 @@ int ISCSINodeInfo::updateConfig(bool create, bool update)
 
     char port_text[64];
     if (int err = StringCopy(port_text, port))
-        return failText(here(), err, "Failed to copy port. lun: %s", toString().c_str());
+        return failText(here(), err, "Failed to copy port. lun: %s", logText(*this).c_str());
     const struct {
         const char *key;
         const char *value;

@@ -52,6 +52,16 @@ ISCSINodeInfo::ISCSINodeInfo(const std::string &uuid, const std::string &hostnam
 
 ISCSINodeInfo::~ISCSINodeInfo() = default;
 
+std::string logText(const ISCSINodeInfo &node)
+{
+    ISCSINodeInfo masked = node;
+    for (std::string *secret : {&masked.rod_key, &masked.session_id}) {
+        if (!secret->empty())
+            *secret = "***";
+    }
+    return masked.toString();
+}
+
 std::string ISCSINodeInfo::toString() const
 {
     return TextLine()
@@ -69,7 +79,7 @@ int ISCSINodeInfo::toJsonFormat(Json::Value &value) const
 {
     if (uuid.empty())
         return failText(here(), ERR_NO_NODE_UUID, "Need node UUID to create node info in Json format: %s",
-                        toString().c_str());
+                        logText(*this).c_str());
     value = Json::Value(Json::objectValue);
     value["uuid"] = uuid;
     value["session_id"] = session_id;

@@ -38,18 +38,18 @@ unsigned int ISCSILIBNode::getStatus() const
 int ISCSILIBNode::createNode()
 {
     if (int err = WebAPIClientNodeCreateSession(info).send())
-        return failText(here(), err, "Failed to create session. node: %s", info.toString().c_str());
+        return failText(here(), err, "Failed to create session. node: %s", logText(info).c_str());
     std::vector<ISCSINodeInfo> joined;
     if (int err = ListNode(joined))
         return failText(here(), err, "Failed to list node.");
     for (const auto &node : joined) {
         if (int err = WebAPIClientNodeAddNode(node, {info}).send())
-            return failText(here(), err, "Failed to add new node to: %s.", node.toString().c_str());
+            return failText(here(), err, "Failed to add new node to: %s.", logText(node).c_str());
     }
     joined.push_back(info);
     const int err = WebAPIClientNodeAddNode(info, joined).send();
     if (err != 0 && err != ERR_NODE_UUID_EXISTS)
-        return failText(here(), err, "Failed to add all of joined nodes to: %s.", info.toString().c_str());
+        return failText(here(), err, "Failed to add all of joined nodes to: %s.", logText(info).c_str());
     return 0;
 }
 

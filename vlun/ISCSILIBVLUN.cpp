@@ -63,7 +63,7 @@ int ISCSILIBVLUN::bind(const std::string &dst_lun_uuid, const std::string &node_
 {
     ISCSINodeInfo node(node_uuid);
     if (int err = node.loadFromDRNode())
-        return failText(here(), err, "Failed to load destination node info. node: %s", node.toString().c_str());
+        return failText(here(), err, "Failed to load destination node info. node: %s", logText(node).c_str());
     if (portals.empty())
         return failText(here(), ERR_NO_PORTAL, "No portal. vLUN: %s", info.toString().c_str());
     if (int err = NORViSCSIVirtualLunBindSink(info.uuid.c_str(), portals.begin()->c_str(), node_uuid.c_str(),

@@ -44,7 +44,8 @@ public:
     ISCSINodeInfo &operator=(ISCSINodeInfo &&) = default;
     virtual ~ISCSINodeInfo();
 
-    /// One line for the log; the password and the one-time code are not in it.
+    /// One line: the ROD key and the session are in it, the password and the one-time code are not. In log lines both
+    /// are masked.
     std::string toString() const;
 
     /// Replaces `value` by the node's JSON form; ERR_NO_NODE_UUID, with `value` untouched, when the

@@ -40,9 +40,9 @@ std::string withoutPlace(const fake::LogLine &line)
 {
     const std::string tag = "[E] iSCSIWebAPI:";
     EXPECT_TRUE(line.priority == LOG_ERR || line.priority == LOG_INFO) << line.priority;
-    EXPECT_EQ(line.text.find(SECRET), std::string::npos) << line.text;
-    EXPECT_EQ(line.text.find(MUTUAL_SECRET), std::string::npos) << line.text;
-    EXPECT_EQ(line.text.find(fake::model().peer.password), std::string::npos) << line.text;
+    for (const std::string &secret : {std::string(SECRET), std::string(MUTUAL_SECRET), fake::model().peer.password,
+                                      std::string(KEPT_ROD_KEY), std::string(PEER_SESSION)})
+        EXPECT_EQ(line.text.find(secret), std::string::npos) << line.text;
 
     std::string text = line.text;
     const bool is_tagged = text.compare(0, tag.size(), tag) == 0;
@@ -206,9 +206,9 @@ void addNodes()
     peer.host = "peer.example";
     peer.port = 5443;
     peer.protocol = "https";
-    peer.cred_session = "peer-session";
+    peer.cred_session = PEER_SESSION;
     fake::model().nodes = {peer, local};
-    fake::model().node_attributes = {{PEER_NODE, "NORV.iSCSI", "rod_key", "kept-rod-key"}};
+    fake::model().node_attributes = {{PEER_NODE, "NORV.iSCSI", "rod_key", KEPT_ROD_KEY}};
 }
 
 Json::Value parsed(const std::string &json)

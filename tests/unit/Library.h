@@ -65,6 +65,8 @@ void addMapping(int tid, int lid, int mapping_index = 1);
 /// This appliance and a paired one in the fake's database, the latter with a ROD key and a session.
 const char *const LOCAL_NODE = "11111111-0000-4000-8000-000000000001";
 const char *const PEER_NODE = "11111111-0000-4000-8000-000000000002";
+const char *const KEPT_ROD_KEY = "kept-rod-key";
+const char *const PEER_SESSION = "peer-session";
 void addNodes();
 
 /// A field of an SDK record, by its place.

@@ -281,7 +281,9 @@ TEST_F(NodeRecord, HasAJSONFormWithoutThePassword)
     node.uuid.clear();
     EXPECT_EQ(node.toJsonFormat(value), 18991110);
     EXPECT_EQ(value["hostname"], "peer.example") << "untouched";
-    EXPECT_EQ(logged(), Lines{"toJsonFormat: Need node UUID to create node info in Json format: " + node.toString()});
+    EXPECT_EQ(logged(),
+              Lines{"toJsonFormat: Need node UUID to create node info in Json format: uuid:  ,is_local_node: true"
+                    " ,rod_key: *** ,hostname: peer.example ,port: 5443 ,protocol: https ,session_id: ***"});
     EXPECT_EQ(ISCSINodeInfo("h", "a", "s").session_id, "s");
     const ISCSINodeInfo whole("u", "s", "h", 7, "p", "r", "a", true);
     EXPECT_EQ(whole.toString() + whole.account,
