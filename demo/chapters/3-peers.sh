@@ -18,9 +18,9 @@ for machine in one two; do
 done
 head -c 12 /dev/urandom | base64 >"$SIGN_IN"
 do_it on two iscsi-host account add admin --role admin --password-file - <"$SIGN_IN"
-until curl --silent --insecure --output /tmp/health "https://$PEER:5443/api/v1/health"; do sleep 0.1; done
-until curl --silent --insecure --output /tmp/health "https://$PORTAL:5443/api/v1/health"; do sleep 0.1; done
-do_it curl --silent --insecure "https://$PEER:5443/api/v1/health"
+for address in "$PORTAL" "$PEER"; do
+    until (exec 3<>"/dev/tcp/$address/5443") 2>/dev/null; do sleep 0.1; done
+done
 do_it on two iscsi-host certificate show
 fingerprint=$(on two iscsi-host certificate show | awk '$1 == "fingerprint" { print $2 }')
 
