@@ -173,7 +173,8 @@ int NORViSCSILunUpdate(_tag_iscsi_lun_ *lun)
         return err;
 
     const auto apply = [&] { return applyUpdate(current, wanted, lock); };
-    if (wanted.record.size == current.record.size) {
+    const bool grows = wanted.record.size != current.record.size;
+    if (!grows) {
         if (int err = apply())
             return err;
     } else {
@@ -181,7 +182,10 @@ int NORViSCSILunUpdate(_tag_iscsi_lun_ *lun)
         if (int err = resizeLunExports(current.record.lid, apply))
             return err;
     }
-    return wanted.record.name == std::string_view(current.record.name) ? 0 : syncLunExports(current.record.lid);
+    if (grows && wanted.record.name == std::string_view(current.record.name))
+        return 0;
+    // With nothing to change, too: the same update may have been killed when it had stored the row.
+    return syncLunExports(current.record.lid);
 }
 
 int NORViSCSILunLoad(_tag_iscsi_lun_ *lun)
