@@ -14,4 +14,7 @@ int syncLunExports(int lid);
 /// returned and changes nothing; after any other failure the next command or start brings the size.
 int resizeLunExports(int lid, const std::function<int()> &grow);
 
+/// NORV_ERR_LUN_LOCKED while a peer writes to the LUN, a sink. One that its peer left open is closed.
+int refuseOpenSink(int lid);
+
 } // namespace norvhost

@@ -9,6 +9,7 @@
 #include "host/storage/LunActions.h"
 #include "host/storage/MapFile.h"
 #include "host/target/Change.h"
+#include "host/target/Exports.h"
 #include "host/target/Portals.h"
 #include "host/target/Tgtd.h"
 #include "platform/error.h"
@@ -17,6 +18,7 @@
 #include <cerrno>
 #include <ctime>
 #include <fcntl.h>
+#include <sys/statvfs.h>
 #include <syslog.h>
 #include <unistd.h>
 
@@ -24,7 +26,14 @@ namespace norvhost {
 namespace {
 
 constexpr int first_sink_tid = 10000;
-constexpr time_t abandoned_seconds = 600;
+constexpr time_t abandoned_seconds = 60;
+
+/// Whoever opened a sink comes within this time.
+constexpr time_t arrival_seconds = 15;
+
+/// Of a volume whose files cannot grow any more; a file system keeps a little for itself.
+constexpr uint64_t full_volume_bytes = 1 << 20;
+
 constexpr size_t secret_bytes = 24;
 constexpr size_t rod_key_size = 256;
 
@@ -138,6 +147,26 @@ int isBlank(const _tag_iscsi_lun_ &lun, bool &blank)
     return 0;
 }
 
+bool isVolumeFull(const _tag_iscsi_lun_ &lun)
+{
+    struct statvfs volume;
+    return statvfs(lun.location, &volume) == 0 && uint64_t{volume.f_bavail} * volume.f_frsize < full_volume_bytes;
+}
+
+/// Closes a sink that its peer has left. One that was closed or opened anew meanwhile is no failure.
+int abandon(const OpenSink &sink)
+{
+    syslog(LOG_WARNING, "LUN %d: the peer that was writing to it is gone", sink.lid);
+    const auto change = [&](std::vector<int> &tids) {
+        tids = {sinkTid(sink.lid)};
+        return removeOpening(sink.lid, sink.iqn);
+    };
+    std::vector<int> tids;
+    // A daemon that does not run has no sessions, and learns of it at its start.
+    const int err = Tgtd(Access::read_write).processId() > 0 ? changeTargets(change) : change(tids);
+    return err == NORV_ERR_NO_SUCH_TARGET ? 0 : err;
+}
+
 bool hasSession(const Tgtd &daemon, int tid)
 {
     std::vector<TgtdConnection> connections;
@@ -247,10 +276,18 @@ int loadSinkLun(int tid, MappedLun &lun)
     return 0;
 }
 
-int dropSink(const std::string &lun_uuid)
+int refuseOpenSink(int lid)
 {
-    const int err = iscsihost::closeSink(lun_uuid, "", false);
-    return err == NORV_ERR_NO_SUCH_TARGET ? 0 : err;
+    std::vector<OpenSink> sinks;
+    if (int err = loadOpenSinks(sinks))
+        return err;
+    for (const OpenSink &sink : sinks)
+        if (sink.lid == lid) {
+            if (hasSession(Tgtd(Access::read_write), sinkTid(lid)) || time(nullptr) - sink.seen < arrival_seconds)
+                return fail(NORV_ERR_LUN_LOCKED, "a peer is writing to the LUN");
+            return abandon(sink);
+        }
+    return 0;
 }
 
 int closeAbandonedSinks()
@@ -266,12 +303,7 @@ int closeAbandonedSinks()
             if (int err = query.bind(sink.lid).bind(sink.iqn).bind(now).run())
                 return err;
         } else if (now - sink.seen > abandoned_seconds || now < sink.seen) {
-            syslog(LOG_WARNING, "LUN %d: the peer that was writing to it is gone", sink.lid);
-            const int err = changeTargets([&](std::vector<int> &tids) {
-                tids = {sinkTid(sink.lid)};
-                return removeOpening(sink.lid, sink.iqn);
-            });
-            if (err && err != NORV_ERR_NO_SUCH_TARGET)
+            if (int err = abandon(sink))
                 return err;
         }
     }
@@ -316,7 +348,7 @@ int openSink(const std::string &lun_uuid, Sink &sink)
     return 0;
 }
 
-int closeSink(const std::string &lun_uuid, const std::string &iqn, bool complete)
+int closeSink(const std::string &lun_uuid, const std::string &iqn, bool complete, bool *volume_full)
 {
     LunRow row;
     if (int err = loadLunByUuid(lun_uuid, row))
@@ -330,6 +362,8 @@ int closeSink(const std::string &lun_uuid, const std::string &iqn, bool complete
     if (complete)
         if (int err = flushData(row.record))
             return err;
+    if (volume_full)
+        *volume_full = isVolumeFull(row.record);
     return changeTargets([&](std::vector<int> &tids) {
         if (int err = removeOpening(lid, opening))
             return err;

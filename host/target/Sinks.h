@@ -42,10 +42,7 @@ int loadSinkMasking(int tid, Masking &masking);
 /// The LUN in it.
 int loadSinkLun(int tid, MappedLun &lun);
 
-/// Closes the LUN's sink, as incomplete, if it is open.
-int dropSink(const std::string &lun_uuid);
-
-/// Closes, as incomplete, the sinks that had no session for ten minutes: whoever opened them is gone.
+/// Closes, as incomplete, the sinks that had no session for a minute: whoever opened them is gone.
 int closeAbandonedSinks();
 
 } // namespace norvhost

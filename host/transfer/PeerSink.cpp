@@ -100,17 +100,22 @@ int openPeerSink(const std::string &node_uuid, const std::string &lun_uuid, cons
     return 0;
 }
 
-int closePeerSink(const std::string &node_uuid, const std::string &lun_uuid, const std::string &sink_iqn, bool complete)
+int closePeerSink(const std::string &node_uuid, const std::string &lun_uuid, const std::string &sink_iqn, bool complete,
+                  bool *volume_full)
 {
     if (NorvDRNode::DRNode::isLocalNodeId(node_uuid))
-        return iscsihost::closeSink(lun_uuid, sink_iqn, complete);
+        return iscsihost::closeSink(lun_uuid, sink_iqn, complete, volume_full);
     PairedNode node;
     Json::Value input, answer;
     input["iqn"] = sink_iqn;
     input["complete"] = complete;
     if (int err = iscsihost::describePairedNode(node_uuid, node))
         return err;
-    return ask(node, lun_uuid, "close", input, answer);
+    if (int err = ask(node, lun_uuid, "close", input, answer))
+        return err;
+    if (volume_full)
+        *volume_full = answer.isObject() && answer["is_volume_full"].isBool() && answer["is_volume_full"].asBool();
+    return 0;
 }
 
 } // namespace norvhost

@@ -22,7 +22,8 @@ struct PeerSink {
 /// of what the node answers, unless it is empty.
 int openPeerSink(const std::string &node_uuid, const std::string &lun_uuid, const std::string &portal, PeerSink &sink);
 
-int closePeerSink(const std::string &node_uuid, const std::string &lun_uuid, const std::string &sink_iqn,
-                  bool complete);
+/// `volume_full`, unless it is null, tells whether the sink's volume has no room left, which iSCSI does not tell.
+int closePeerSink(const std::string &node_uuid, const std::string &lun_uuid, const std::string &sink_iqn, bool complete,
+                  bool *volume_full = nullptr);
 
 } // namespace norvhost

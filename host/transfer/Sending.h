@@ -33,8 +33,8 @@ struct Sending {
 };
 
 /// Sends it all and flushes the unit. One connection, which is not made again: whoever wants to go on after a failure
-/// begins anew with the ranges that are left, from where it was flushed to. Takes 16 MiB of memory, whatever the size. The calling thread does
-/// everything; a process may fork before and after.
+/// begins anew with the ranges that are left, from where it was flushed to. Takes 16 MiB of memory, whatever the size.
+/// The calling thread does everything; a process may fork before and after.
 ///
 /// 0, the code of `next` or `progress`, or a negative errno value with its reason recorded:
 /// -ECONNREFUSED (no portal there), -EACCES (the log-in was refused), -ECONNRESET (the connection broke), -ETIMEDOUT

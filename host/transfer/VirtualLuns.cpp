@@ -136,6 +136,7 @@ struct SenderJob {
 private:
     int send(uint64_t &moved);
     int goOn(uint64_t moved) const;
+    bool sinkIsFull() const;
 };
 
 int SenderJob::prepare(const char *portal, const char *node_uuid, const char *sink_uuid)
@@ -189,6 +190,8 @@ void SenderJob::run()
     int code = send(moved);
     if (code == 0)
         code = closePeerSink(row.node, row.sink, row.sink_iqn, true);
+    if (code == -EIO && sinkIsFull())
+        code = fail(-ENOSPC, "the sink's volume is full");
     if (code != 0 && code != -ECANCELED)
         syslog(LOG_ERR, "the virtual LUN %s stopped sending: %s", row.uuid.c_str(), lastError());
     if (endVirtualLun(row.uuid, stateOf(code), code ? moved : row.total, row.total) != 0)
@@ -220,6 +223,16 @@ int SenderJob::goOn(uint64_t moved) const
     if (err && err != NORV_ERR_VLUN_UUID)
         return err;
     return err || now.ended || now.sink_iqn != row.sink_iqn ? transferStopped() : 0;
+}
+
+/// Closes it, too.
+bool SenderJob::sinkIsFull() const
+{
+    const std::string reason = lastError();
+    bool full = false;
+    if (closePeerSink(row.node, row.sink, row.sink_iqn, false, &full) != 0)
+        fail(-EIO, "%s", reason.c_str());
+    return full;
 }
 
 int loadNamed(const char *uuid, VirtualLunRow &row)

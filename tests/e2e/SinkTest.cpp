@@ -261,7 +261,7 @@ TEST_F(SinkTest, SurvivesRestartsAndIsClosedWhenNobodyComes)
     EXPECT_EQ(send(unit(opened), opened.blank), 0) << iscsi_host_last_error();
     EXPECT_EQ(norvhost::closeAbandonedSinks(), 0) << iscsi_host_last_error();
     EXPECT_EQ(send(unit(opened), opened.blank), 0) << "too early to be closed";
-    norvhost::Query past("UPDATE sinks SET seen = seen - 601");
+    norvhost::Query past("UPDATE sinks SET seen = seen - 61");
     ASSERT_EQ(past.run(), 0);
     EXPECT_EQ(norvhost::closeAbandonedSinks(), 0) << iscsi_host_last_error();
     EXPECT_LT(send(unit(opened), opened.blank), 0);

@@ -29,9 +29,12 @@ Result closeSink(const Request &request)
     if (Result bad = selectLun(request.path.at("lun"), lun_uuid); bad.code)
         return bad;
     const Json::Value &in = request.input;
-    if (int err = iscsihost::closeSink(lun_uuid, in["iqn"].asString(), in["complete"].asBool()))
+    bool volume_full = false;
+    if (int err = iscsihost::closeSink(lun_uuid, in["iqn"].asString(), in["complete"].asBool(), &volume_full))
         return failed(err);
-    return {};
+    Result result;
+    result.value["is_volume_full"] = volume_full;
+    return result;
 }
 
 } // namespace webapi

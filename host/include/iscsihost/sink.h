@@ -18,14 +18,17 @@ struct Sink {
 
 /// Lets the holder of this appliance's ROD key write to the LUN, which must be of the sink kind. Whoever had it open
 /// before loses it: a sender that comes back after a failure need not wait. While it is open, other actions on the LUN
-/// find it locked. Without a session for ten minutes it is closed again, as incomplete, by the service's supervisor.
+/// find it locked, unless nobody has a session there any more: that closes it, as incomplete, and so does the service's
+/// supervisor after a minute.
 /// NORV_ERR_NO_SUCH_LUN, NORV_ERR_LUN_TYPE, NORV_ERR_LUN_LOCKED, NORV_ERR_START_SERVICE.
 ISCSI_HOST_API int openSink(const std::string &lun_uuid, Sink &sink);
 
 /// Ends the opening that bears this name, or whichever there is when the name is empty; its sessions end. With
 /// `complete`, what was written is flushed first, and the LUN becomes an ordinary extent-pool LUN, writable for its
 /// initiators, unless a replication task has it as its destination. NORV_ERR_NO_SUCH_TARGET when it is not open (any
-/// more); after another failure it is still open.
-ISCSI_HOST_API int closeSink(const std::string &lun_uuid, const std::string &iqn, bool complete);
+/// more); after another failure it is still open. `volume_full`, unless it is null, tells whether the LUN's volume has
+/// no room left: iSCSI does not tell its peer why a write failed.
+ISCSI_HOST_API int closeSink(const std::string &lun_uuid, const std::string &iqn, bool complete,
+                             bool *volume_full = nullptr);
 
 } // namespace iscsihost
