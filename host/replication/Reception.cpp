@@ -7,6 +7,7 @@
 #include "host/replication/TaskStore.h"
 #include "host/storage/LunStore.h"
 #include "host/storage/MapFile.h"
+#include "host/storage/SnapshotStore.h"
 #include "host/storage/Versions.h"
 #include "iscsihost/replication.h"
 #include "platform/error.h"
@@ -168,6 +169,28 @@ int iscsihost::endReception(const std::string &task_uuid, const std::string &ver
     Arrival arrived;
     arrived.name = destination.arrival.name;
     return updateArrival(destination.task.record.uuid, arrived);
+}
+
+int iscsihost::findArrivedSnapshot(const std::string &lun_uuid, int64_t snapshot_time, std::string &uuid)
+{
+    LunRow lun;
+    Versions versions;
+    std::vector<SnapshotRow> snapshots;
+    uuid.clear();
+    if (int err = loadLunByUuid(lun_uuid, lun))
+        return err;
+    if (lun.record.type != NORV_LUN_TYPE_SINK)
+        return 0;
+    if (int err = readVersions(dataPath(lun.record), versions))
+        return err;
+    if (versions.current != versions.base)
+        return 0;
+    if (int err = loadSnapshotsOfLun(lun.record.lid, snapshots))
+        return err;
+    for (const SnapshotRow &row : snapshots)
+        if (row.record.version == versions.base && row.record.snap_time == snapshot_time && !isInTrash(row.record))
+            uuid = row.record.uuid;
+    return 0;
 }
 
 int iscsihost::arrivedBytes(const std::string &lun_uuid, uint64_t &bytes)

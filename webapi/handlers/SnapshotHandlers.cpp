@@ -1,6 +1,7 @@
 #include "webapi/handlers/Handlers.h"
 
 #include "iscsihost/host.h"
+#include "iscsihost/replication.h"
 #include "iscsiwebapi/ISCSIErrorCode.h"
 #include "iscsiwebapi/ISCSILIBLUN.h"
 
@@ -147,6 +148,12 @@ Result takeSnapshot(const Request &request)
     const long point_in_time = static_cast<long>(in["snapshot_time"].asInt64());
     std::string uuid;
     int id = 0;
+    if (point_in_time && in["name"].asString().empty()) { // a peer, which asks again when it did not hear the answer
+        if (int err = iscsihost::findArrivedSnapshot(lun.info.uuid, point_in_time, uuid))
+            return failed(err);
+        if (!uuid.empty())
+            return describe(uuid);
+    }
     if (int err =
             lun.takeSnapshot(in["is_app_consistent"].asBool(), in["is_user_locked"].asBool(), in["name"].asString(),
                              in["description"].asString(), actor(request, "taken_by"),

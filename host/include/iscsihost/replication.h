@@ -42,6 +42,10 @@ ISCSI_HOST_API int noteReception(const std::string &task_uuid, const std::string
 /// All has arrived and is flushed: the version is the LUN's base now. Codes as above.
 ISCSI_HOST_API int endReception(const std::string &task_uuid, const std::string &version);
 
+/// The snapshot of that time which a destination LUN has of the state that it holds: whoever did not hear that it was
+/// taken asks again. Empty when there is none.
+ISCSI_HOST_API int findArrivedSnapshot(const std::string &lun_uuid, int64_t snapshot_time, std::string &uuid);
+
 /// Bytes that have arrived so far of the state that arrives at a LUN; 0 when none does.
 ISCSI_HOST_API int arrivedBytes(const std::string &lun_uuid, uint64_t &bytes);
 
