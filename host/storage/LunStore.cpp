@@ -131,13 +131,6 @@ int countMappings(int lid, int &count)
     return 0;
 }
 
-int isSinkOpen(int lid, bool &open)
-{
-    Query query("SELECT 1 FROM sinks WHERE lid = ?1");
-    open = query.bind(lid).next();
-    return query.error();
-}
-
 int insertLun(const LunRow &row)
 {
     Transaction transaction;

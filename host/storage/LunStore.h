@@ -30,9 +30,6 @@ int countMappings(int lid, int &count);
 /// Whether initiators may be using the LUN: it is mapped and loaded.
 int isInUse(const LunRow &row, bool &in_use);
 
-/// Whether a peer may be writing to the LUN, a sink.
-int isSinkOpen(int lid, bool &open);
-
 /// Adds a row: NORV_ERR_LUN_NAME_EXISTS when another LUN bears the name, NORV_ERR_LUN_LOCATION when the volume was
 /// removed meanwhile or another LUN has the device.
 int insertLun(const LunRow &row);

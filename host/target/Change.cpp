@@ -56,7 +56,47 @@ int apply(const ServiceLock &lock, const std::function<int(std::vector<int> &)> 
     return transaction.commit();
 }
 
+int commitRows(const std::function<int(std::vector<int> &)> &rows, std::vector<int> &tids)
+{
+    Transaction transaction;
+    if (transaction.error())
+        return transaction.error();
+    if (int err = rows(tids))
+        return err;
+    return transaction.commit();
+}
+
 } // namespace
+
+int reconcileRunning(const ServiceLock &lock, bool was_marked, const std::vector<int> &tids)
+{
+    for (Access access : {Access::read_write, Access::read}) {
+        const Tgtd daemon(access);
+        if (daemon.processId() == 0)
+            continue;
+        if (int err = was_marked ? reconcileDaemon(daemon) : reconcileTargets(daemon, tids))
+            return err;
+    }
+    lock.clear();
+    return removeUnusedExportLinks();
+}
+
+int changeRunning(const std::function<int(std::vector<int> &)> &rows)
+{
+    ServiceLock lock;
+    std::vector<int> tids;
+    if (int err = lock.take())
+        return err;
+    const bool was_marked = daemonsMarked();
+    if (int err = lock.mark())
+        return err;
+    if (int err = commitRows(rows, tids)) {
+        if (!was_marked)
+            lock.clear();
+        return err;
+    }
+    return reconcileRunning(lock, was_marked, tids);
+}
 
 int changeTargets(const std::function<int(std::vector<int> &)> &rows)
 {

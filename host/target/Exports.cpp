@@ -1,7 +1,6 @@
 #include "host/target/Exports.h"
 
-#include "host/target/ExportLinks.h"
-#include "host/target/Reconcile.h"
+#include "host/target/Change.h"
 #include "host/target/ServiceLock.h"
 #include "host/target/TargetStore.h"
 
@@ -34,15 +33,7 @@ int resizeLunExports(int lid, const std::function<int()> &grow)
     std::vector<int> tids;
     for (const Mapping &mapping : mappings)
         tids.push_back(mapping.tid);
-    for (Access access : {Access::read_write, Access::read}) {
-        const Tgtd daemon(access);
-        if (daemon.processId() == 0)
-            continue;
-        if (int err = was_marked ? reconcileDaemon(daemon) : reconcileTargets(daemon, tids))
-            return err;
-    }
-    lock.clear();
-    return removeUnusedExportLinks();
+    return reconcileRunning(lock, was_marked, tids);
 }
 
 } // namespace norvhost

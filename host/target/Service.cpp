@@ -251,6 +251,9 @@ int startMissing()
             continue;
         if (int err = lock.mark())
             return err;
+        if (access == Access::read_write)
+            if (int err = forgetOpenSinks())
+                return err;
         if (int err = startTgtd(daemon))
             return err;
         changed = true;

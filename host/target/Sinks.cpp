@@ -161,9 +161,7 @@ int abandon(const OpenSink &sink)
         tids = {sinkTid(sink.lid)};
         return removeOpening(sink.lid, sink.iqn);
     };
-    std::vector<int> tids;
-    // A daemon that does not run has no sessions, and learns of it at its start.
-    const int err = Tgtd(Access::read_write).processId() > 0 ? changeTargets(change) : change(tids);
+    const int err = changeRunning(change);
     return err == NORV_ERR_NO_SUCH_TARGET ? 0 : err;
 }
 
@@ -290,6 +288,12 @@ int refuseOpenSink(int lid)
     return 0;
 }
 
+int forgetOpenSinks()
+{
+    Query query("DELETE FROM sinks");
+    return query.run();
+}
+
 int closeAbandonedSinks()
 {
     std::vector<OpenSink> sinks;
@@ -364,7 +368,7 @@ int closeSink(const std::string &lun_uuid, const std::string &iqn, bool complete
             return err;
     if (volume_full)
         *volume_full = isVolumeFull(row.record);
-    return changeTargets([&](std::vector<int> &tids) {
+    return changeRunning([&](std::vector<int> &tids) {
         if (int err = removeOpening(lid, opening))
             return err;
         tids = {sinkTid(lid)};

@@ -42,6 +42,9 @@ int loadSinkMasking(int tid, Masking &masking);
 /// The LUN in it.
 int loadSinkLun(int tid, MappedLun &lun);
 
+/// Closes all of them when their daemon is down: it took their sessions along, and a sender opens a sink anew.
+int forgetOpenSinks();
+
 /// Closes, as incomplete, the sinks that had no session for a minute: whoever opened them is gone.
 int closeAbandonedSinks();
 

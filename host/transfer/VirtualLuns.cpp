@@ -19,6 +19,7 @@
 #include <cerrno>
 #include <cstring>
 #include <fcntl.h>
+#include <poll.h>
 #include <syslog.h>
 #include <unistd.h>
 
@@ -35,6 +36,9 @@ constexpr uint64_t last_step = 4096;
 
 /// A sender notices within a tenth of a second that it is to stop; what it may hang in after that moves no data.
 constexpr auto stop_limit = 5s;
+
+/// How long the peer's web server is tried when everything was sent; shorter than a sink stays open without a session.
+constexpr auto complete_limit = 40s;
 
 std::string lockName(const std::string &uuid)
 {
@@ -136,6 +140,7 @@ struct SenderJob {
 private:
     int send(uint64_t &moved);
     int goOn(uint64_t moved) const;
+    int complete(uint64_t moved) const;
     bool sinkIsFull() const;
 };
 
@@ -189,7 +194,7 @@ void SenderJob::run()
     uint64_t moved = 0;
     int code = send(moved);
     if (code == 0)
-        code = closePeerSink(row.node, row.sink, row.sink_iqn, true);
+        code = complete(moved);
     if (code == -EIO && sinkIsFull())
         code = fail(-ENOSPC, "the sink's volume is full");
     if (code != 0 && code != -ECANCELED)
@@ -223,6 +228,22 @@ int SenderJob::goOn(uint64_t moved) const
     if (err && err != NORV_ERR_VLUN_UUID)
         return err;
     return err || now.ended || now.sink_iqn != row.sink_iqn ? transferStopped() : 0;
+}
+
+/// All is there: a web server that happens to be down must not make it vain.
+int SenderJob::complete(uint64_t moved) const
+{
+    const auto deadline = std::chrono::steady_clock::now() + complete_limit;
+    for (;;) {
+        const int err = closePeerSink(row.node, row.sink, row.sink_iqn, true);
+        if (err != NORV_ERR_SEND_REQUEST || std::chrono::steady_clock::now() > deadline)
+            return err;
+        for (int i = 0; i < 10; ++i) { // one second, looking whether we are to stop
+            poll(nullptr, 0, 100);
+            if (int stop = goOn(moved))
+                return stop;
+        }
+    }
 }
 
 /// Closes it, too.
