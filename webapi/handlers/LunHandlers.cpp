@@ -1,6 +1,7 @@
 #include "webapi/handlers/Handlers.h"
 
 #include "iscsihost/host.h"
+#include "iscsihost/read_view.h"
 #include "iscsihost/replication.h"
 #include "iscsiwebapi/ISCSIErrorCode.h"
 #include "iscsiwebapi/ISCSILIBLUN.h"
@@ -124,8 +125,11 @@ Result listLuns(const Request &request)
     using Flags = ISCSILUNInfo::LoadFlags;
     const bool with_status = request.input["status"].asBool();
     std::vector<ISCSILUNInfo> luns;
-    if (int err = ISCSILIBLUN::ListLUN(luns, Flags::LOAD_MAPPED | (with_status ? Flags::LOAD_LOCKED : 0)))
-        return failed(err);
+    {
+        const iscsihost::ReadView view;
+        if (int err = ISCSILIBLUN::ListLUN(luns, Flags::LOAD_MAPPED | (with_status ? Flags::LOAD_LOCKED : 0)))
+            return failed(err);
+    }
     Result result;
     result.value = Json::arrayValue;
     for (ISCSILUNInfo &lun : luns) {
