@@ -7,6 +7,7 @@ import sys
 
 import clones
 import conformance
+import replication
 import snapshots
 import web
 from machines import MIB, PLAIN_TARGET, VOLUME, PlainTgtd, appliance, make_lun, run
@@ -102,6 +103,7 @@ def main():
         web.api_calls()
         listing()
     clones.remote_clones()
+    replication.replications()
     if misses:
         print(f"\nAbove the limit: {', '.join(misses)}")
     return 1 if misses else 0
