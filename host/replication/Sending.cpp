@@ -1,6 +1,5 @@
 #include "host/replication/Sending.h"
 
-#include "host/core/Crypto.h"
 #include "host/core/LastError.h"
 #include "host/core/Lock.h"
 #include "host/peer/Address.h"
@@ -11,7 +10,9 @@
 #include "host/storage/SnapshotFiles.h"
 #include "host/storage/SnapshotStore.h"
 #include "host/target/Sinks.h"
+#include "host/target/Stunnel.h"
 #include "host/transfer/PeerSink.h"
+#include "host/transfer/Tunnel.h"
 #include "iscsihost/node.h"
 #include "platform/core.h"
 #include "platform/dr_node.h"
@@ -21,7 +22,6 @@
 #include <cerrno>
 #include <chrono>
 #include <cstring>
-#include <iscsi/iscsi.h>
 #include <json/value.h>
 #include <memory>
 #include <syslog.h>
@@ -50,6 +50,13 @@ std::string textOf(const char *text)
     return text ? text : "";
 }
 
+/// How data is to get to the peer, as far as the caller says.
+struct Route {
+    std::string host; ///< empty: the one that the peer gives
+    uint16_t port = 0;
+    bool encrypted = false; ///< the port is one that TLS is spoken on
+};
+
 /// The peer's sink, open until the object ends.
 class OpenSink {
 public:
@@ -58,16 +65,16 @@ public:
     ~OpenSink() { close(false); }
 
     /// The log-in is made with the key that the caller has, not with the one that is stored with the node.
-    int open(const TaskRow &task, const std::string &rod_key, const std::string &portal)
+    int open(const TaskRow &task, const std::string &rod_key, const Route &route)
     {
         const std::string lun_uuid = task.record.dst_lun_uuid;
-        if (int err = openPeerSink(task.remoteNode(), lun_uuid, portal, sink))
+        if (int err = openPeerSink(task.remoteNode(), lun_uuid, "", sink))
             return err;
         is_open = true;
         const SinkLogIn log_in = sinkLogIn(rod_key, lun_uuid);
         sink.unit.secret = log_in.secret;
         sink.unit.mutual_secret = log_in.mutual_secret;
-        return 0;
+        return follow(route, rod_key);
     }
 
     int close(bool complete)
@@ -79,9 +86,36 @@ public:
     }
 
     const IscsiUnit &unit() const { return sink.unit; }
+    /// After a failure to send there.
+    int explain(int failure) const { return tunnel.explain(failure); }
 
 private:
+    int follow(const Route &route, const std::string &rod_key)
+    {
+        std::string host;
+        uint16_t port = 0;
+        if (!parseAuthority(sink.unit.portal, host, port))
+            return fail(NORV_ERR_BAD_RESPONSE, "the peer gives no data address");
+        if (!route.host.empty())
+            host = route.host;
+        if (route.encrypted && sink.sink.tls_port == 0)
+            return fail(NORV_ERR_BAD_PARAMETER,
+                        "encrypted: the peer takes no encrypted sendings: 'iscsi-host status' there says why");
+        if (route.encrypted)
+            port = static_cast<uint16_t>(sink.sink.tls_port);
+        if (route.port != 0)
+            port = route.port;
+        sink.unit.portal = authority(host, port);
+        if (!route.encrypted)
+            return 0;
+        if (int err = tunnel.open(host, port, rod_key))
+            return err;
+        sink.unit.portal = tunnel.portal();
+        return 0;
+    }
+
     PeerSink sink;
+    Tunnel tunnel;
     bool is_open = false;
 };
 
@@ -97,7 +131,7 @@ public:
         base_lock.leaveToChild();
     }
 
-    std::string portal; ///< of the peer's data; empty: the one that it gives
+    Route route;
     std::string rod_key;
 
 private:
@@ -193,7 +227,7 @@ int Sender::send()
     if (int err = describe(reception))
         return err;
     OpenSink sink;
-    if (int err = sink.open(task, rod_key, portal))
+    if (int err = sink.open(task, rod_key, route))
         return err;
     if (int err = sendAll(sink))
         return err;
@@ -258,7 +292,7 @@ int Sender::sendAll(const OpenSink &sink)
             return 0;
         };
         if (int err = sendRanges(sending))
-            return err;
+            return sink.explain(err);
         moved_before += FLUSH_INTERVAL - budget;
         if (int err = note(offset))
             return err;
@@ -295,36 +329,6 @@ int Sender::tell(uint64_t moved)
     task.progress.send_total_size = total;
     task.progress.progress_value = task.progress.sent_size * 100 / total;
     return updateProgress(task.progress);
-}
-
-/// A discovery log-in: whoever answers it is a portal.
-int checkPortal(const std::string &portal)
-{
-    const std::unique_ptr<iscsi_context, decltype(&iscsi_destroy_context)> context(
-        iscsi_create_context("iqn.2001-01.norv:check"), iscsi_destroy_context);
-    if (!context)
-        return fail(NORV_ERR_OUT_OF_MEMORY, "no memory for a connection");
-    iscsi_set_session_type(context.get(), ISCSI_SESSION_DISCOVERY);
-    iscsi_set_noautoreconnect(context.get(), 1);
-    iscsi_set_timeout(context.get(), 10);
-    if (iscsi_connect_sync(context.get(), portal.c_str()) != 0 || iscsi_login_sync(context.get()) != 0)
-        return fail(-ECONNREFUSED, "no iSCSI portal answers at %s: %s", portal.c_str(), iscsi_get_error(context.get()));
-    iscsi_disconnect(context.get());
-    return 0;
-}
-
-/// Whether it is the key of a paired appliance.
-int checkRodKey(const std::string &rod_key)
-{
-    std::vector<NorvDRNode::DRNode> nodes;
-    if (!NorvDRNode::DRNodeDB::List(nodes, NorvDRNode::CRED_REMOTE))
-        return NORV_ERR_GET_CONFIG;
-    for (const NorvDRNode::DRNode &node : nodes) {
-        PairedNode paired;
-        if (iscsihost::describePairedNode(node.id, paired) == 0 && sameBytes(paired.rod_key, rod_key))
-            return 0;
-    }
-    return fail(NORV_ERR_ROD_KEY, "the ROD key is no paired appliance's");
 }
 
 } // namespace
@@ -382,14 +386,14 @@ int NORViSCSIReplicationTaskSendSnapshot(const _tag_iscsi_task_ *task, const cha
     Sender sender;
     sender.rod_key = rod_key;
     if (encrypted)
-        return fail(NORV_ERR_BAD_PARAMETER, "sending inside TLS is not possible here");
+        if (int err = requireStunnel())
+            return err;
     if (port > UINT16_MAX)
         return fail(NORV_ERR_TASK_ADDRESS, "port: is no port");
     const std::string host = textOf(address);
     if (!host.empty() && !isHost(host))
         return fail(NORV_ERR_TASK_ADDRESS, "address: is no host name and no address");
-    if (!host.empty())
-        sender.portal = authority(host, static_cast<uint16_t>(port ? port : 3261));
+    sender.route = {host, static_cast<uint16_t>(port), encrypted};
     if (int err = sender.prepare(*task, snapshot_uuid, full_sync ? nullptr : base_version))
         return err;
     const int child = NLIBCProcForkChildNoWait();
@@ -408,15 +412,4 @@ int NORViSCSIReplicationTaskStopSendingSnapshot(const _tag_iscsi_task_ *task)
     if (!isSending(task->uuid))
         return fail(NORV_ERR_TASK_NOT_RUNNING, "the task %s is not sending", task->uuid);
     return requestStop(task->uuid, true);
-}
-
-int NORViSCSIReplicationTaskCheckConnection(const char *address, unsigned int port, const char *rod_key)
-{
-    if (!address || !rod_key || !*rod_key)
-        return fail(NORV_ERR_NULL_POINTER, "an address and a ROD key are needed");
-    if (!isHost(address) || port > UINT16_MAX)
-        return fail(NORV_ERR_TASK_ADDRESS, "address: is no host name or address with a port");
-    if (int err = checkRodKey(rod_key))
-        return err;
-    return checkPortal(authority(address, static_cast<uint16_t>(port ? port : 3260)));
 }

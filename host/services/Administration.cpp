@@ -12,6 +12,7 @@
 #include "host/storage/Volumes.h"
 #include "host/target/Portals.h"
 #include "host/target/Service.h"
+#include "host/target/TlsServer.h"
 #include "iscsihost/host.h"
 
 #include <sys/statvfs.h>
@@ -184,6 +185,8 @@ int status(Status &status)
     if (int err = forEachLun(look_at))
         return err;
     now.service_alive = iscsiServiceAlive();
+    now.tls_problem = tlsProblem();
+    now.tls_port = now.tls_problem.empty() ? tls_port : 0;
     status = std::move(now);
     return 0;
 }

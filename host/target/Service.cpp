@@ -14,6 +14,7 @@
 #include "host/target/Sinks.h"
 #include "host/target/TargetStore.h"
 #include "host/target/Tgtd.h"
+#include "host/target/TlsServer.h"
 #include "host/target/Wait.h"
 #include "platform/error.h"
 
@@ -110,7 +111,7 @@ int spawnDaemon(const std::string &name, std::vector<std::string> arguments, con
 /// tgtd tells every failed command; on a broken disk that is a lot.
 void cutMessages()
 {
-    for (const char *name : {"tgtd-rw", "tgtd-ro", "iscsi-portald"}) {
+    for (const char *name : {"tgtd-rw", "tgtd-ro", "iscsi-portald", "stunnel"}) {
         struct stat status;
         const std::string path = messagesPath(name);
         if (stat(path.c_str(), &status) == 0 && status.st_size > messages_max && truncate(path.c_str(), 0) != 0)
@@ -224,6 +225,16 @@ int startPortal()
     return serves && !ended ? 0 : didNotStart("iscsi-portald");
 }
 
+/// Nothing but encrypted sendings waits for it: what keeps it away is no failure of the service, and logged once.
+void startTlsOrSayWhyNot()
+{
+    static std::string told;
+    const std::string reason = startTls() == 0 ? "" : lastError();
+    if (!reason.empty() && reason != told)
+        syslog(LOG_WARNING, "no encrypted sendings to this appliance: %s", reason.c_str());
+    told = reason;
+}
+
 /// Under the lock: everything, and the links of LUNs that no target shows any more.
 int reconcileBoth(const ServiceLock &lock)
 {
@@ -264,6 +275,7 @@ int startMissing()
     if (processLockHolder(portalLockPath()) <= 0)
         if (int err = startPortal())
             return err;
+    startTlsOrSayWhyNot();
     return markBooted();
 }
 
@@ -271,8 +283,8 @@ int startMissing()
 std::vector<FileDescriptor> watchedProcesses()
 {
     std::vector<FileDescriptor> processes;
-    for (pid_t pid :
-         {Tgtd(Access::read_write).processId(), Tgtd(Access::read).processId(), processLockHolder(portalLockPath())})
+    for (pid_t pid : {Tgtd(Access::read_write).processId(), Tgtd(Access::read).processId(),
+                      processLockHolder(portalLockPath()), tlsProcess()})
         if (pid > 0)
             processes.emplace_back(pidfd_open(pid, 0));
     return processes;
@@ -285,7 +297,7 @@ bool waitForEvent(int signals)
     std::vector<pollfd> events = {{signals, POLLIN, 0}};
     for (const FileDescriptor &process : processes)
         events.push_back({process.get(), POLLIN, 0});
-    const std::chrono::milliseconds interval = processes.size() == 3 ? supervise_interval : retry_interval;
+    const std::chrono::milliseconds interval = iscsiServiceAlive() ? supervise_interval : retry_interval;
     poll(events.data(), events.size(), static_cast<int>(interval.count()));
     return events[0].revents != 0;
 }
@@ -305,6 +317,8 @@ int stopService()
     if (int err = lock.take())
         return err;
     int err = stopPortal();
+    if (int failed = endProcess(tlsProcess, SIGTERM))
+        err = failed;
     for (Access access : {Access::read_write, Access::read})
         if (int failed = stopTgtd(Tgtd(access)))
             err = failed;

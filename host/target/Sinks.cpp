@@ -12,6 +12,7 @@
 #include "host/target/Exports.h"
 #include "host/target/Portals.h"
 #include "host/target/Tgtd.h"
+#include "host/target/TlsServer.h"
 #include "platform/error.h"
 #include "platform/extent_pool.h"
 
@@ -337,6 +338,7 @@ int openSink(const std::string &lun_uuid, Sink &sink)
         return err;
     opened.iqn = "iqn.2001-01.norv:sink-" + newUuid();
     opened.lun = sink_lun_number;
+    opened.tls_port = tlsProcess() > 0 ? tls_port : 0;
     opened.size = row.record.size;
     const int lid = row.record.lid;
     const int err = changeTargets([&](std::vector<int> &tids) {

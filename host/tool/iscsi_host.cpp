@@ -171,6 +171,8 @@ int showStatus(bool as_json)
         Json::Value json;
         json["service_alive"] = status.service_alive;
         json["portal"] = status.portal;
+        json["tls_port"] = status.tls_port;
+        json["tls_problem"] = status.tls_problem;
         json["luns"] = status.luns;
         json["targets"] = status.targets;
         json["volumes"] = toJson(status.volumes);
@@ -186,6 +188,9 @@ int showStatus(bool as_json)
     } else {
         printf("iSCSI service: %s\n", status.service_alive ? "running" : "not running (iscsi-host boot starts it)");
         printf("portal:        %s\n", status.portal.c_str());
+        printf("TLS:           %s\n", status.tls_port
+                                          ? ("port " + std::to_string(status.tls_port)).c_str()
+                                          : ("no encrypted sendings to here: " + status.tls_problem).c_str());
         printf("LUNs:          %d, %zu unhealthy\n", status.luns, status.unhealthy.size());
         printf("targets:       %d\n\n", status.targets);
         printVolumes(status.volumes);

@@ -8,6 +8,7 @@
 #include "platform/extent_pool.h"
 
 #include <algorithm>
+#include <cstdint>
 #include <json/value.h>
 
 namespace norvhost {
@@ -34,7 +35,8 @@ bool readSink(const Json::Value &answer, Sink &sink)
     sink.lun = answer["lun"].asInt();
     sink.size = answer["size"].asUInt64();
     sink.blank = answer["is_blank"].asBool();
-    return sink.iqn.compare(0, 4, "iqn.") == 0 && sink.lun >= 0;
+    sink.tls_port = answer["tls_port"].isInt() ? answer["tls_port"].asInt() : 0;
+    return sink.iqn.compare(0, 4, "iqn.") == 0 && sink.lun >= 0 && sink.tls_port >= 0 && sink.tls_port <= UINT16_MAX;
 }
 
 /// "[::1]" of "::1"; names and IPv4 addresses as they are.

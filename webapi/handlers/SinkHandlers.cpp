@@ -18,6 +18,7 @@ Result openSink(const Request &request)
     result.value["portal"] = sink.portal;
     result.value["iqn"] = sink.iqn;
     result.value["lun"] = sink.lun;
+    result.value["tls_port"] = sink.tls_port;
     result.value["size"] = static_cast<Json::UInt64>(sink.size);
     result.value["is_blank"] = sink.blank;
     return result;

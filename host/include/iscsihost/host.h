@@ -79,6 +79,8 @@ struct UnhealthyLun {
 struct Status {
     bool service_alive = false; ///< all daemons answer
     std::string portal;
+    int tls_port = 0;        ///< where sendings are taken in inside TLS; 0 while they are not
+    std::string tls_problem; ///< why not
     int luns = 0;
     int targets = 0;
     std::vector<Volume> volumes;

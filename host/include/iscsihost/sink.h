@@ -12,6 +12,7 @@ struct Sink {
     std::string portal; ///< "address:port", or ":port" when this appliance listens on all its addresses
     std::string iqn;    ///< of the target that exists until the sink is closed; names this opening
     int lun = 0;        ///< LUN number in it
+    int tls_port = 0;   ///< of the same address, which leads there inside TLS; 0 when there is none
     uint64_t size = 0;  ///< bytes
     bool blank = false; ///< reads as zeros
 };

@@ -4,6 +4,7 @@
 #include "host/core/LastError.h"
 #include "host/target/portal/Conversation.h"
 #include "host/target/portal/StoreDirectory.h"
+#include "host/target/Portals.h"
 #include "platform/error.h"
 
 #include <algorithm>
@@ -64,35 +65,6 @@ bool localAddress(int fd, std::string &address, int &port)
     return true;
 }
 
-int listenOn(const ListenAddress &where, FileDescriptor &listener)
-{
-    sockaddr_storage name = {};
-    socklen_t size;
-    auto *v4 = reinterpret_cast<sockaddr_in *>(&name);
-    auto *v6 = reinterpret_cast<sockaddr_in6 *>(&name);
-    if (inet_pton(AF_INET, where.address.c_str(), &v4->sin_addr) == 1) {
-        name.ss_family = AF_INET;
-        v4->sin_port = htons(static_cast<uint16_t>(where.port));
-        size = sizeof *v4;
-    } else if (inet_pton(AF_INET6, where.address.c_str(), &v6->sin6_addr) == 1) {
-        name.ss_family = AF_INET6;
-        v6->sin6_port = htons(static_cast<uint16_t>(where.port));
-        size = sizeof *v6;
-    } else {
-        return fail(NORV_ERR_BAD_PARAMETER, "portal address: '%s' is no IP address", where.address.c_str());
-    }
-    listener.reset(socket(name.ss_family, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0));
-    const int on = 1;
-    setsockopt(listener.get(), SOL_SOCKET, SO_REUSEADDR, &on, sizeof on);
-    if (name.ss_family == AF_INET6)
-        setsockopt(listener.get(), IPPROTO_IPV6, IPV6_V6ONLY, &on, sizeof on);
-    if (!listener || bind(listener.get(), reinterpret_cast<sockaddr *>(&name), size) != 0 ||
-        listen(listener.get(), SOMAXCONN) != 0)
-        return failErrno(NORV_ERR_START_SERVICE, errno, "the iSCSI portal cannot listen on %s port %d",
-                         where.address.c_str(), where.port);
-    return 0;
-}
-
 class Server {
 public:
     int listen(const std::vector<ListenAddress> &addresses);
@@ -139,7 +111,7 @@ int Server::listen(const std::vector<ListenAddress> &addresses)
         return failErrno(NORV_ERR_START_SERVICE, errno, "the iSCSI portal cannot start");
     for (const ListenAddress &address : addresses) {
         listeners.emplace_back();
-        if (int err = listenOn(address, listeners.back()))
+        if (int err = listenOn(address.address, address.port, listeners.back()))
             return err;
     }
     watch(signals_fd.get(), EPOLLIN, &signals_fd, EPOLL_CTL_ADD);
