@@ -47,6 +47,7 @@ class RemoteClone(PairTest):
 
     def start_slow_clone(self, name):
         """`iscsictl ... --watch` in the background, once data flows."""
+        wait_until(lambda: self.one.json("vlun", "list") == [], "the virtual LUN of the clone before goes")
         self.slow()
         watching = self.one.start("iscsictl", *self.command(name), "--watch", stdin=subprocess.DEVNULL,
                                   stdout=subprocess.PIPE, stderr=subprocess.PIPE)
@@ -108,6 +109,7 @@ class RemoteClone(PairTest):
         places, gap = 64, SIZE_MIB * MIB // 64
         self.make_lun("written", SIZE_MIB)
         write(self.one, "written", "/tmp/noise")
+        run("qemu-io", "--image-opts", image(self.one, "written"), stdin="".join(f"write -q -P 0 {place * gap} 4k\n" for place in range(places)))
         with open("/tmp/rounds", "w", encoding="ascii") as script:
             script.writelines(f"write -q -P {number} {place * gap} 4k\n" for number in range(1, 250) for place in range(places))
         with open("/tmp/rounds", encoding="ascii") as script:
