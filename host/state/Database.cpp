@@ -17,7 +17,7 @@
 namespace norvhost {
 namespace {
 
-constexpr int busy_timeout_ms = 10000;
+constexpr int busy_timeout_ms = 30000;
 
 struct KeptStatement {
     sqlite3_stmt *statement = nullptr;
