@@ -1,7 +1,8 @@
 #!/usr/bin/env bash
-# machine.sh NAME DISK: one machine of a pair, in namespaces that pair.py has just made for it: folders of its own where an appliance
-# keeps things, and nothing running. What outlives a boot lies in the folder DISK. Says "made", reads the machine's address from standard input when its network card is there,
-# says "ready", and is then the machine's first process: when it dies, the machine is gone.
+# machine.sh NAME DISK: one machine of a pair, in namespaces that pair.py has just made for it: folders of its own where an
+# appliance keeps things, and nothing running. What outlives a boot lies in the folder DISK. Says "made", reads the machine's
+# address from standard input when its network card is there, says "ready", and is then the machine's first process: when it
+# dies, the machine is gone.
 set -euo pipefail
 
 hostname "$1"

@@ -67,6 +67,7 @@ class Machine:
         self.name, self.address = name, address
         self.disk = f"{DISKS}/{name}"
         self.log_lines = []
+        self.services = []
         os.makedirs(self.disk, exist_ok=True)
         run("umount", "--quiet", self.disk, check=False)  # of an earlier machine of the name
         run("mount", "-t", "tmpfs", "-o", "mode=0755", "tmpfs", self.disk)
@@ -107,9 +108,13 @@ class Machine:
         receiver = socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM)
         receiver.bind(f"/proc/{self.pid}/root/dev/log")
 
+        # Also for whoever looks for it on the machine.
+        log = open(f"/proc/{self.pid}/root/var/log/syslog", "a", encoding="utf-8", buffering=1)
+
         def take():
             while True:
                 self.log_lines.append(receiver.recv(8192).decode(errors="replace"))
+                log.write(self.log_lines[-1].partition(">")[2] + "\n")
 
         threading.Thread(target=take, daemon=True).start()
 
@@ -119,6 +124,8 @@ class Machine:
         self.holder.kill()
         self.holder.wait()
         wait_until(lambda: not is_alive(self.pid), f"{self.name} is off")
+        while self.services:
+            self.services.pop().wait()
         self.holder.stdin.close()
         self.holder.stdout.close()
         os.unlink(f"{MACHINES}/{self.name}")
@@ -173,7 +180,7 @@ class Appliance(Machine):
 
     def boot(self):
         self.host("boot")
-        self.supervisor = self._serve("iscsi-host", "run")
+        self._serve("iscsi-host", "run")
         self.start_web()
 
     def restart(self):
@@ -196,7 +203,8 @@ class Appliance(Machine):
     def _serve(self, *command):
         """A program that runs in the foreground, as a service manager would start it."""
         with open(f"{MACHINES}/{self.name}.log", "a", encoding="utf-8") as log:
-            return self.start(*command, stdin=subprocess.DEVNULL, stdout=log, stderr=log, start_new_session=True)
+            self.services.append(self.start(*command, stdin=subprocess.DEVNULL, stdout=log, stderr=log, start_new_session=True))
+        return self.services[-1]
 
     def start_web(self):
         web = self._serve("iscsi-host", "web", "run")

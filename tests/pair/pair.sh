@@ -53,7 +53,7 @@ $(show)
 Try:
   ./run pair exec one iscsi-host status
   ./run pair exec one iscsictl node join 192.0.2.12 --account admin
-  ./run pair shell two
+  ./run pair shell two              (its log is in /var/log/syslog)
 TEXT
 }
 
