@@ -102,6 +102,12 @@ void addShow(Commands &commands, CLI::App &noun)
     addJson(verb, a->json);
 }
 
+std::string whyFailed(const Json::Value &sending)
+{
+    const std::string reason = sending["reason"].asString();
+    return sending["error_text"].asString() + (reason.empty() ? "" : ": " + shown(reason));
+}
+
 void addStatus(Commands &commands, CLI::App &noun)
 {
     auto a = std::make_shared<Arguments>();
@@ -115,7 +121,7 @@ void addStatus(Commands &commands, CLI::App &noun)
                          {"To send", shownSize(sending["send_total_size"].asUInt64())},
                          {"Ended with", error == 0         ? "no error"
                                         : error == STOPPED ? "stopped on purpose"
-                                                           : sending["error_text"].asString()}}));
+                                                           : whyFailed(sending)}}));
     });
     addJson(verb, a->json);
 }
@@ -132,7 +138,7 @@ Progress sendingProgress(const std::string &task)
         progress.done = progress.total = 0; // the counts of the sending before
     const int error = told["error"].asInt();
     if (!progress.running && error != 0)
-        throw Failure{error, error == STOPPED ? "it was stopped on purpose" : ""};
+        throw Failure{error, error == STOPPED ? "it was stopped on purpose" : told["reason"].asString()};
     return progress;
 }
 

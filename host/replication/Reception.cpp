@@ -26,6 +26,7 @@ namespace {
 
 /// A task's destination LUN.
 struct Destination {
+    NamedLock lock;
     TaskRow task;
     LunRow lun;
     std::string path;
@@ -38,6 +39,8 @@ struct Destination {
 
 int Destination::load(const std::string &task_uuid)
 {
+    if (int err = lockArrival(task_uuid, lock))
+        return err;
     if (int err = loadTask(task_uuid, task))
         return err;
     if (task.record.is_source)
@@ -113,9 +116,14 @@ int iscsihost::beginReception(const std::string &task_uuid, const Incoming &inco
     if (int err = shutSink(destination.lun.record.uuid))
         return err;
     if (!goOn(destination, incoming, begun)) {
+        if (int err = updateArrival(destination.task.record.uuid, {}))
+            return err;
         if (int err = prepare(destination, incoming, begun))
             return err;
     }
+    if (begun.holding != Holding::base && destination.versions.base == incoming.version)
+        if (int err = forgetBase(destination.path)) // else a part of the version would be taken for the whole
+            return err;
     if (int err = updateArrival(destination.task.record.uuid,
                                 {incoming.version, incoming.base, wordOf(begun.holding), incoming.name, begun.offset}))
         return err;
@@ -155,7 +163,8 @@ int iscsihost::endReception(const std::string &task_uuid, const std::string &ver
     Destination destination;
     if (int err = destination.load(task_uuid))
         return err;
-    if (destination.versions.base == version && destination.versions.current == version)
+    if (isSynchronised(destination.versions) && destination.versions.base == version &&
+        destination.arrival.version.empty())
         return 0; // told twice
     if (int err = destination.checkArriving(version))
         return err;

@@ -99,6 +99,13 @@ int releaseSink(const LunRow &lun)
 {
     if (lun.record.type != NORV_LUN_TYPE_SINK)
         return 0;
+    TaskRow task;
+    NamedLock lock;
+    if (int err = loadTaskOfSink(lun.record.uuid, task); err && err != NORV_ERR_NO_SUCH_TASK)
+        return err;
+    else if (!err)
+        if (int failed = lockArrival(task.record.uuid, lock))
+            return failed;
     if (int err = settle(lun))
         return err;
     return changeKind(lun, NORV_LUN_TYPE_ADV, [] { return 0; });
@@ -107,6 +114,12 @@ int releaseSink(const LunRow &lun)
 int becomeSource(TaskRow &task)
 {
     LunRow lun;
+    NamedLock lock;
+    if (int err = lockArrival(task.record.uuid, lock))
+        return err;
+    const std::string uuid = task.record.uuid;
+    if (int err = loadTask(uuid, task))
+        return err;
     if (task.record.is_source)
         return fail(NORV_ERR_NOT_A_DESTINATION_TASK, "the task %s is a source already", task.record.uuid);
     if (int err = loadLunByUuid(task.localLun(), lun))

@@ -14,9 +14,11 @@
 #include "host/transfer/PeerSink.h"
 #include "host/transfer/Tunnel.h"
 #include "iscsihost/node.h"
+#include "iscsihost/replication.h"
 #include "platform/core.h"
 #include "platform/dr_node.h"
 #include "platform/error.h"
+#include "platform/event_log.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -38,7 +40,12 @@ constexpr int RUNNING = -EINPROGRESS; // stored while a sender works: with its l
 constexpr int KILLED = -EPIPE;
 constexpr int STOPPED = -ENODEV;
 constexpr uint64_t UNIT = 512; // what is said to be sent where nothing differs
+constexpr int FINAL = -EPROTO; // trying again is of no use, and nobody does
+constexpr unsigned EVENT_DESTINATION = 0x13d0000d;
+
+/// After so much, or so long, what was sent is flushed, so that it needs not be sent again.
 constexpr uint64_t FLUSH_INTERVAL = 256 << 20;
+constexpr auto FLUSH_PERIOD = std::chrono::seconds(5);
 
 std::string lockName(const char *task_uuid)
 {
@@ -77,12 +84,12 @@ public:
         return follow(route, rod_key);
     }
 
-    int close(bool complete)
+    int close(bool complete, bool *volume_full = nullptr)
     {
         if (!is_open)
             return 0;
         is_open = false;
-        return closePeerSink(sink.node, sink.lun, sink.sink.iqn, complete);
+        return closePeerSink(sink.node, sink.lun, sink.sink.iqn, complete, volume_full);
     }
 
     const IscsiUnit &unit() const { return sink.unit; }
@@ -136,6 +143,8 @@ public:
 
 private:
     int send();
+    int refused(OpenSink &sink) const;
+    int outcome(int err) const;
     int describe(const Json::Value &reception);
     int sendAll(const OpenSink &sink);
     int note(uint64_t offset);
@@ -145,12 +154,14 @@ private:
     NamedLock lock;
     SnapshotLock snapshot_lock, base_lock;
     TaskRow task;
+    LunRow lun;
     SnapshotRow snapshot, base;
     FileDescriptor file, base_file;
     PairedNode peer;
     std::vector<DataRange> ranges;
     uint64_t total = 0, moved_before = 0, offset = 0;
     bool to_zeros = false;
+    bool was_full = false; ///< the peer's volume, when it was tried last
     Clock::time_point told{};
 };
 
@@ -177,7 +188,6 @@ int Sender::prepare(const _tag_iscsi_task_ &wanted, const char *snapshot_uuid, c
         return err;
     if (!lock.held())
         return fail(NORV_ERR_TASK_LOCKED, "the task %s is sending a snapshot already", task.record.uuid);
-    LunRow lun;
     if (int err = loadLunByUuid(task.localLun(), lun))
         return err;
     if (int err = loadSnapshotByUuid(snapshot_uuid, snapshot))
@@ -203,17 +213,49 @@ int Sender::prepare(const _tag_iscsi_task_ &wanted, const char *snapshot_uuid, c
         return err;
     if (int err = requestStop(task.record.uuid, false))
         return err;
+    was_full = task.progress.error == NORV_ERR_OUT_OF_SPACE;
     task.progress.sent_size = task.progress.send_total_size = task.progress.progress_value = 0;
     task.progress.error = RUNNING;
+    if (int err = updateReason(task.record.uuid, ""))
+        return err;
     return updateProgress(task.progress);
 }
 
 void Sender::run()
 {
-    task.progress.error = send();
-    if (task.progress.error && task.progress.error != STOPPED)
-        syslog(LOG_ERR, "sending the snapshot '%s' failed: %s", snapshot.record.name, lastError());
+    task.progress.error = outcome(send());
+    if (task.progress.error && task.progress.error != STOPPED) {
+        const std::string reason = lastError();
+        syslog(LOG_ERR, "sending the snapshot '%s' failed: %s", snapshot.record.name, reason.c_str());
+        updateReason(task.record.uuid, reason);
+    }
+    if (task.progress.error == NORV_ERR_OUT_OF_SPACE && !was_full)
+        NORVLogSet1(9, 1, EVENT_DESTINATION, lun.record.name, "Out of volume space", nullptr, nullptr);
     updateProgress(task.progress);
+}
+
+/// The code to store.
+int Sender::outcome(int err) const
+{
+    switch (err) {
+    case -ENOSPC:
+        return NORV_ERR_OUT_OF_SPACE;
+    case NORV_ERR_NOT_A_DESTINATION_TASK:
+    case NORV_ERR_NO_SUCH_TASK:
+        return FINAL;
+    default:
+        return err;
+    }
+}
+
+/// The peer could not write: it knows whether its volume is full, which its unit does not tell.
+int Sender::refused(OpenSink &sink) const
+{
+    const std::string reason = lastError();
+    bool full = false;
+    if (sink.close(false, &full) == 0 && full)
+        return fail(NORV_ERR_OUT_OF_SPACE, "the peer's volume is full");
+    return fail(-EIO, "%s", reason.c_str());
 }
 
 int Sender::send()
@@ -230,7 +272,7 @@ int Sender::send()
     if (int err = sink.open(task, rod_key, route))
         return err;
     if (int err = sendAll(sink))
-        return err;
+        return err == -EIO ? refused(sink) : err;
     if (int err = sink.close(true))
         return err;
     Json::Value end(Json::objectValue);
@@ -269,6 +311,7 @@ int Sender::sendAll(const OpenSink &sink)
         ++at;
     while (at < ranges.size()) {
         uint64_t budget = FLUSH_INTERVAL;
+        const auto limit = Clock::now() + FLUSH_PERIOD;
         norvhost::Sending sending;
         sending.to = sink.unit();
         sending.from = file.get();
@@ -276,7 +319,7 @@ int Sender::sendAll(const OpenSink &sink)
         sending.progress = [&](uint64_t moved) { return tell(moved); };
         sending.next = [&](DataRange &range) {
             range = {};
-            if (at == ranges.size() || budget == 0)
+            if (at == ranges.size() || budget == 0 || Clock::now() > limit)
                 return 0;
             const DataRange &whole = ranges[at];
             range = whole;
@@ -376,6 +419,21 @@ int readProgress(const TaskRow &task, _tag_iscsi_task_progress_ &progress)
 } // namespace norvhost
 
 using namespace norvhost;
+
+int iscsihost::sendingFailure(const std::string &task_uuid, std::string &reason)
+{
+    TaskRow task;
+    _tag_iscsi_task_progress_ progress;
+    if (int err = loadTask(task_uuid, task))
+        return err;
+    if (int err = readProgress(task, progress))
+        return err;
+    if (progress.error == KILLED)
+        reason = "the sending process was killed";
+    else
+        return loadReason(task.record.uuid, reason);
+    return 0;
+}
 
 int NORViSCSIReplicationTaskSendSnapshot(const _tag_iscsi_task_ *task, const char *address, const char *rod_key,
                                          const char *snapshot_uuid, const char *base_version, unsigned int port,

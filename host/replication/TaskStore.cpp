@@ -136,6 +136,26 @@ int stopRequested(std::string_view task_uuid, bool &stop)
     return 0;
 }
 
+int loadReason(std::string_view task_uuid, std::string &reason)
+{
+    Query query("SELECT reason FROM replication_tasks WHERE uuid = ?1");
+    if (!query.bind(task_uuid).next())
+        return query.error() ? query.error() : noSuchTask(task_uuid);
+    reason = query.text(0);
+    return 0;
+}
+
+int updateReason(std::string_view task_uuid, const std::string &reason)
+{
+    Query query("UPDATE replication_tasks SET reason = ?2 WHERE uuid = ?1");
+    return change(query.bind(task_uuid).bind(reason), task_uuid);
+}
+
+int lockArrival(std::string_view task_uuid, NamedLock &lock)
+{
+    return lock.take("arrival-" + lowerCase(task_uuid));
+}
+
 int loadArrival(std::string_view task_uuid, Arrival &arrival)
 {
     Query query(

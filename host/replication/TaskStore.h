@@ -1,6 +1,7 @@
 /// Rows of replication tasks in the state store.
 #pragma once
 
+#include "host/core/Lock.h"
 #include "platform/replication.h"
 
 #include <cstdint>
@@ -54,6 +55,12 @@ int requestStop(std::string_view task_uuid, bool stop);
 int stopRequested(std::string_view task_uuid, bool &stop);
 int removeTask(std::string_view uuid);
 
+/// Why the latest sending failed, in words; empty when it did not.
+int loadReason(std::string_view task_uuid, std::string &reason);
+int updateReason(std::string_view task_uuid, const std::string &reason);
+
+/// Locks what arrives for a task, and its role, until the lock's end: the steps of either belong together.
+int lockArrival(std::string_view task_uuid, NamedLock &lock);
 int loadArrival(std::string_view task_uuid, Arrival &arrival);
 int updateArrival(std::string_view task_uuid, const Arrival &arrival);
 

@@ -234,6 +234,7 @@ CREATE TABLE replication_tasks (
     total INTEGER NOT NULL DEFAULT 0,
     progress INTEGER NOT NULL DEFAULT 0,
     error INTEGER NOT NULL DEFAULT 0,
+    reason TEXT NOT NULL DEFAULT '',
     stop INTEGER NOT NULL DEFAULT 0,
     arriving TEXT NOT NULL DEFAULT '',
     arriving_base TEXT NOT NULL DEFAULT '',

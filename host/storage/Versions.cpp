@@ -174,6 +174,21 @@ int beginSynchronisation(const std::string &path, const std::string &incoming)
     return flush(file, path);
 }
 
+int forgetBase(const std::string &path)
+{
+    FileDescriptor file;
+    struct stat status;
+    StoredVersions stored;
+    if (int err = openMapFile(path, file, status))
+        return err;
+    if (int err = readStored(file.get(), path, stored))
+        return err;
+    snprintf(stored.base, sizeof stored.base, "%s", NORV_ZERO_UUID);
+    if (int err = writeStored(file.get(), path, stored))
+        return err;
+    return flush(file, path);
+}
+
 int finishSynchronisation(const std::string &path)
 {
     FileDescriptor file;

@@ -36,6 +36,9 @@ int readVersions(const std::string &path, Versions &versions);
 /// The state `incoming` begins to arrive: from now on the current version differs from the base.
 int beginSynchronisation(const std::string &path, const std::string &incoming);
 
+/// The file is being made anew: it holds nothing of its base any more, and has none.
+int forgetBase(const std::string &path);
+
 /// Flushes the file; then the state that arrived is its base.
 int finishSynchronisation(const std::string &path);
 

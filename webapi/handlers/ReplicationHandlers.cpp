@@ -34,8 +34,14 @@ int addProgress(ISCSILIBReplication &replication, Json::Value &out)
     out["send_total_size"] = Json::UInt64(total);
     out["progress_value"] = Json::UInt64(value);
     out["error"] = error;
-    if (error)
+    if (error) {
+        std::string reason;
+        if (int err = iscsihost::sendingFailure(replication.task.uuid, reason))
+            return err;
         out["error_text"] = ErrorCodeToString(error);
+        if (!reason.empty())
+            out["reason"] = reason;
+    }
     return 0;
 }
 
@@ -273,6 +279,8 @@ Result demoteReplication(const Request &request)
 Result deleteReplication(const Request &request)
 {
     return withTask(request, [&](ISCSILIBReplication &replication) {
+        // A LUN that a peer writes to is not deleted. A source has nothing to break, and a lost task none either.
+        iscsihost::breakReception(replication.task.uuid);
         const int err = replication.deleteReplication(request.input["delete_lun"].asBool());
         return err ? failed(err) : Result();
     });

@@ -1,4 +1,4 @@
-/// The receiving side of a sending, as its peer asks for it.
+/// The receiving side of a sending, as its peer asks for it, and what became of a sending.
 #pragma once
 
 #include <cstdint>
@@ -48,5 +48,8 @@ ISCSI_HOST_API int findArrivedSnapshot(const std::string &lun_uuid, int64_t snap
 
 /// Bytes that have arrived so far of the state that arrives at a LUN; 0 when none does.
 ISCSI_HOST_API int arrivedBytes(const std::string &lun_uuid, uint64_t &bytes);
+
+/// Why the latest sending of a task failed, in words; empty when it did not, or when its code says all.
+ISCSI_HOST_API int sendingFailure(const std::string &task_uuid, std::string &reason);
 
 } // namespace iscsihost
