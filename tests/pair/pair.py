@@ -166,6 +166,11 @@ class Machine:
     def mend_link(self):
         run("ip", "link", "set", self.name, "up")
 
+    def received_bytes(self):
+        """That came to the machine over its link."""
+        link = json.loads(run("ip", "-json", "-statistics", "link", "show", self.name).stdout)[0]
+        return link["stats64"]["tx"]["bytes"]
+
 
 class Appliance(Machine):
     """A machine with a booted and supervised appliance: one volume, the web API, one account in it."""

@@ -71,11 +71,11 @@ class ReplicationTest(PairTest):
         for fact in ("name", "version", "description", "taken_by", "snapshot_time", "is_app_consistent", "is_user_locked", "total_size"):
             self.assertEqual(there[0][fact], here[fact], fact)
 
-    def begin(self, name="disturbed"):
+    def begin(self, name="disturbed", after_mib=4):
         """A slow sending of a new snapshot, with data on its way; the snapshot."""
         snapshot = self.take(name)
         self.slow()
         self.one.iscsictl("replication", "send", self.task, snapshot)
-        wait_until(lambda: self.sending()["sent_size"] > 4 * MIB, "data flows")
+        wait_until(lambda: self.sending()["sent_size"] > after_mib * MIB, "data flows")
         self.assertTrue(self.sending()["is_locked"])
         return snapshot

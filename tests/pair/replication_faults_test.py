@@ -1,11 +1,13 @@
 """Faults while snapshots are sent: afterwards no data is lost, nothing stays locked, and the next sending succeeds or says why not."""
+import json
 import os
 import random
 import signal
 import sqlite3
+import subprocess
 import time
 
-from cases import MIB, checksum, checksum_at, image, main, write
+from cases import MIB, checksum_at, image, main
 from pair import VOLUME, is_alive, run, wait_until
 from replication_cases import SIZE_MIB, ReplicationTest
 
@@ -79,6 +81,14 @@ class Faults(ReplicationTest):
         self.expect_unlocked()
         self.expect_replica(snapshot)
 
+    def arrived(self):
+        """Below which place of the destination all is flushed, as it has been told."""
+        return self.store(self.two).execute("SELECT arrived FROM replication_tasks WHERE uuid = ?", (self.task,)).fetchone()[0]
+
+    def change_much(self, dice):
+        run("qemu-io", "--image-opts", image(self.one, "data"),
+            *(part for _ in range(6) for part in ("-c", f"write -P {dice.randrange(256)} {dice.randrange(SIZE_MIB - 2)}M 2M")))
+
     def delete_snapshots(self, but):
         for appliance in (self.one, self.two):
             for snapshot in appliance.json("snapshot", "list", self.lun):
@@ -102,21 +112,210 @@ class Faults(ReplicationTest):
             round_ += 1
             victim = list(victims)[round_ % len(victims)]
             with self.subTest(seed=seed, round=round_, victim=victim):
-                run("qemu-io", "--image-opts", image(self.one, "data"),
-                    *(part for _ in range(6) for part in ("-c", f"write -P {dice.randrange(256)} {dice.randrange(SIZE_MIB - 2)}M 2M")))
+                self.change_much(dice)
                 snapshot = self.take(f"round {round_}")
                 self.slow()
-                self.one.run("iscsictl", "replication", "send", self.task, snapshot)
-                time.sleep(dice.uniform(0, 1.5))  # the moment, not a wait
+                start = self.one.start("iscsictl", "replication", "send", self.task, snapshot, stdout=subprocess.DEVNULL)
+                time.sleep(dice.uniform(0, 2))  # the moment, not a wait
                 kills += self.killed(victims[victim]())
                 self.full_speed()
+                start.wait(timeout=120)
                 self.services_back()
                 wait_until(lambda: not self.senders(), "the sender ends", 90)
                 if self.sending()["error"]:
                     self.give_up()
                 self.wait_idle()
+                if dice.random() < 0.3:
+                    self.change_much(dice)
+                    snapshot = self.take(f"round {round_} again")
                 self.expect_whole(snapshot)
                 self.delete_snapshots(but=snapshot)
+
+    def test_retried(self):
+        """A sending that fails goes on by itself, from where its data was flushed."""
+        snapshot = self.begin()
+        wait_until(lambda: self.arrived() > 0, "some of it is flushed", 60)
+        flushed = self.arrived()
+        self.killed(self.senders())
+        self.full_speed()
+        received = self.two.received_bytes()
+        wait_until(lambda: self.sending()["sent_size"] == SIZE_MIB * MIB, "the worker sends again", 120)
+        self.expect_unlocked()
+        self.assertLess(self.two.received_bytes() - received, (SIZE_MIB + 2) * MIB - flushed)
+        self.expect_replica(snapshot)
+
+    def test_link_cut(self):
+        for number, seconds in enumerate(CUTS):
+            with self.subTest(seconds=seconds):
+                self.change_much(random.Random(number))
+                snapshot = self.begin(f"cut for {seconds} s", after_mib=1)
+                self.two.cut_link()
+                time.sleep(seconds)  # how long it is cut, not a wait
+                self.two.mend_link()
+                self.full_speed()
+                # A connection that found its way again may be through before anybody gives up.
+                wait_until(lambda: not self.senders(), "the sender ends", 150)
+                if self.sending()["error"]:
+                    self.give_up()
+                self.expect_whole(snapshot)
+
+    def test_peer_restarted(self):
+        snapshot = self.begin()
+        wait_until(lambda: self.arrived() > 0, "some of it is flushed", 60)
+        self.two.restart()
+        flushed = self.arrived()
+        self.assertGreater(flushed, 0)
+        self.give_up()
+        received = self.two.received_bytes()
+        self.expect_whole(snapshot)
+        self.assertLess(self.two.received_bytes() - received, (SIZE_MIB + 2) * MIB - flushed)
+
+    def test_volume_full(self):
+        """While data arrives, and when only the snapshot is left to take."""
+        free = json.loads(self.two.host("volume", "list", "--json"))[0]["free_bytes"]
+        self.two.iscsictl("lun", "create", "fat", "--location", VOLUME, "--size", str((free // MIB - SIZE_MIB // 2) * MIB), "--type", "file")
+        snapshot = self.take("too much")
+        self.one.iscsictl("replication", "send", self.task, snapshot)
+        wait_until(lambda: self.sending()["error"], "the sending fails", 60)
+        self.assertEqual(self.sending()["error"], 18990002)
+        self.assertIn("Out of volume space", self.one.iscsictl("events"))
+        self.give_up()
+        self.two.iscsictl("lun", "delete", "fat", "--yes")
+        self.expect_whole(snapshot)
+
+    def test_too_many_snapshots(self):
+        self.send(self.take("first"))
+        store = self.store(self.two)
+        lid, = store.execute("SELECT lid FROM luns WHERE name = ?", (self.lun,)).fetchone()
+        store.execute("""
+            WITH RECURSIVE number (n) AS (SELECT 2 UNION ALL SELECT n + 1 FROM number WHERE n < 256)
+            INSERT INTO snapshots SELECT lid, n, printf('%08x-0000-0000-0000-%012x', lid, n), 'filler ' || n, '', '', uuid, create_time,
+                snap_time, flags, 0, 0, total_size, 0, NULL FROM snapshots, number WHERE lid = ?""", (lid,))
+        self.change(self.one, 7, 64, 0x77)
+        snapshot = self.take("one too many")
+        self.refused(self.one, "replication", "send", self.task, snapshot, "--watch", says="18990543", timeout=120)
+        self.assertEqual(self.sending()["error"], 18990543)
+        self.assertIn("Maximum snapshot count reached", self.one.iscsictl("events"))
+        store.execute("DELETE FROM snapshots WHERE lid = ? AND name LIKE 'filler %'", (lid,))
+        self.expect_unlocked()
+        self.assertEqual(self.send(snapshot), 512, "the data is there already")
+        self.expect_replica(snapshot)
+
+    def test_base_deleted(self):
+        self.send(first := self.take("first"))
+        self.change(self.one, 1, 64, 0x11)
+        on_two = self.two.json("snapshot", "list", self.lun)[0]["uuid"]
+        self.two.iscsictl("snapshot", "delete", on_two, "--yes")
+        self.assertEqual(self.send(second := self.take("second")), 64 << 10, "the destination itself is the base")
+        self.expect_replica(second)
+
+        self.change_much(random.Random(1))
+        third = self.begin("third", after_mib=1)
+        self.refused(self.one, "snapshot", "delete", second, "--yes", says="locked")
+        self.two.iscsictl("snapshot", "delete", self.two.json("snapshot", "list", self.lun)[0]["uuid"], "--yes")
+        self.killed(self.senders())
+        self.give_up()
+        for snapshot in (first, second, third):
+            self.one.iscsictl("snapshot", "delete", snapshot, "--yes")
+        self.expect_whole(self.take("nothing in common"))
+
+    def test_written_on_destination(self):
+        self.send(first := self.take("first"))
+        self.change(self.one, 1, 64, 0x11)
+        second = self.take("second")
+        path = self.two.run("find", VOLUME, "-name", f"*_{self.lun}_*", "-path", "*Extent*").stdout.split()[0]
+        self.two.run("dd", "if=/dev/urandom", f"of={path}", "bs=1M", "seek=30", "count=1", "conv=notrunc,fsync")
+        self.assertEqual(self.send(second), 64 << 10, "set back to the common snapshot first")
+        self.expect_replica(second)
+
+        self.two.iscsictl("replication", "promote", self.task)
+        self.two.iscsictl("lun", "map", self.lun, "data")
+        self.change(self.two, 20, 128, 0x22)
+        self.refused(self.one, "replication", "send", self.task, second, says="Not a destination task")
+        self.two.iscsictl("lun", "unmap", self.lun, "data")
+        self.two.iscsictl("replication", "demote", self.task)
+        self.change(self.one, 2, 64, 0x33)
+        self.assertEqual(self.send(third := self.take("third")), 64 << 10)
+        self.expect_replica(third)
+
+        # Nothing to set it back to.
+        self.two.iscsictl("replication", "promote", self.task)
+        for snapshot in self.two.json("snapshot", "list", self.lun):
+            self.two.iscsictl("snapshot", "delete", snapshot["uuid"], "--yes")
+        self.two.iscsictl("lun", "map", self.lun, "data")
+        self.change(self.two, 40, 128, 0x44)
+        self.two.iscsictl("lun", "unmap", self.lun, "data")
+        self.two.iscsictl("replication", "demote", self.task)
+        self.expect_whole(third)
+
+    def test_promoted_while_sending(self):
+        self.send(first := self.take("first"))
+        wanted = checksum_at(self.one, "data")
+        self.change_much(random.Random(2))
+        self.begin(after_mib=1)
+        self.two.iscsictl("replication", "promote", self.task)
+        self.full_speed()
+        self.wait_idle()
+        self.expect_unlocked()
+        self.assertEqual(self.sending()["error"], -71, "nothing to try again")
+        self.refused(self.one, "replication", "send", self.task, first, says="Not a destination task")
+        self.two.iscsictl("lun", "map", self.lun, "data")
+        self.assertEqual(checksum_at(self.two, "data"), wanted, "the last whole state")
+        self.change(self.two, 5, 64, 0x55)
+        self.one.iscsictl("lun", "unmap", self.lun, "data")
+        self.one.iscsictl("replication", "demote", self.task)
+        self.assertEqual(self.send(self.take("over there", self.two), self.two), 64 << 10)
+        self.assertEqual(self.replica(self.one), checksum_at(self.two, "data"))
+
+    def test_removed_while_sending(self):
+        snapshot = self.begin()
+        self.two.iscsictl("replication", "remove", self.task, "--delete-lun")
+        self.assertEqual(self.two.json("lun", "list"), [])
+        self.give_up()
+        self.refused(self.one, "replication", "send", self.task, snapshot, says="18990810")
+
+    def test_wrong_key(self):
+        store = self.store(self.one)
+        peer = self.two.json("node", "list")[0]["uuid"]
+        key, = store.execute("SELECT value FROM node_attributes WHERE uuid = ? AND key = 'rod_key'", (peer,)).fetchone()
+        store.execute("UPDATE node_attributes SET value = ? WHERE uuid = ? AND key = 'rod_key'", (key[::-1], peer))
+        snapshot = self.take("first")
+        self.one.iscsictl("replication", "send", self.task, snapshot)
+        wait_until(lambda: self.sending()["error"], "the sending fails", 60)
+        self.assertRegex(self.one.iscsictl("replication", "status", self.task), "cannot log in")
+        self.assertNotIn(key, "".join(self.one.log_lines + self.two.log_lines))
+        self.give_up()
+        self.one.iscsictl("node", "check", self.two.address, "--address", self.two.address)  # asks for the key
+        self.expect_whole(snapshot)
+
+    def test_clocks_apart(self):
+        """The times of the destination's snapshots are an hour off, either way."""
+        self.send(self.take("first"))
+        for hours in (-1, 1):
+            with self.subTest(hours=hours):
+                self.change(self.one, 1, 64, 0x10 + hours)
+                self.send(self.take(f"common {hours}"))
+                # Fail over, to a clock that is off.
+                self.one.iscsictl("lun", "unmap", self.lun, "data")
+                self.two.iscsictl("replication", "promote", self.task)
+                self.one.iscsictl("replication", "demote", self.task)
+                self.two.iscsictl("lun", "map", self.lun, "data")
+                self.change(self.two, 2, 64, 0x20 + hours)
+                there = self.take(f"over there {hours}", self.two)
+                self.store(self.two).execute("UPDATE snapshots SET snap_time = snap_time + ?1, create_time = create_time + ?1 WHERE uuid = ?2",
+                                             (hours * 3600, there))
+                self.assertEqual(self.send(there, self.two), 64 << 10)
+                self.assertEqual(self.replica(self.one), checksum_at(self.two, "data"))
+                # And back.
+                self.change(self.two, 3, 64, 0x30 + hours)
+                self.two.iscsictl("lun", "unmap", self.lun, "data")
+                self.two.iscsictl("replication", "demote", self.task)
+                self.one.iscsictl("replication", "promote", self.task)
+                self.one.iscsictl("lun", "map", self.lun, "data")
+                self.change(self.one, 4, 64, 0x40 + hours)
+                # The common snapshot that looks newest may be an older one: more is sent, nothing is lost.
+                self.assertLessEqual(self.send(back := self.take(f"back {hours}")), 128 << 10)
+                self.expect_replica(back)
 
 
 if __name__ == "__main__":
