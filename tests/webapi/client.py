@@ -13,6 +13,7 @@ import urllib.parse
 from appliance import Appliance, ISCSI_HOST
 
 ADDRESS = "127.0.0.1"
+IDLE_LIMIT = 4  # seconds; the server keeps an idle connection for ten
 PASSWORD = "correct horse battery"
 ROOT = "/api/v1"
 
@@ -24,6 +25,7 @@ class Client:
         context = ssl.create_default_context(cafile=pem) if pem else ssl._create_unverified_context()
         self.connection = http.client.HTTPSConnection("localhost", port, timeout=60, context=context, source_address=source)
         self.headers = {}
+        self.used = time.monotonic()
 
     def login(self, account, password=PASSWORD):
         self.headers["Authorization"] = "Bearer " + self.ok("POST", "/session", account=account, password=password)["token"]
@@ -31,6 +33,8 @@ class Client:
 
     def raw(self, method, target, body=None, headers=None):
         """Status, headers and body as they came."""
+        if time.monotonic() - self.used > IDLE_LIMIT:
+            self.connection.close()  # the server may be doing the same
         try:
             self.connection.request(method, target, body=body, headers={**self.headers, **(headers or {})})
             response = self.connection.getresponse()
@@ -41,7 +45,9 @@ class Client:
                 raise
             self.connection.request(method, target, body=body, headers={**self.headers, **(headers or {})})
             response = self.connection.getresponse()
-        return response.status, response.headers, response.read()
+        answer = response.status, response.headers, response.read()
+        self.used = time.monotonic()
+        return answer
 
     def call(self, method, path, **fields):
         """Status and JSON value."""
