@@ -1,6 +1,7 @@
 /// Whether a sending could reach a peer.
 #include "host/core/Crypto.h"
 #include "host/core/LastError.h"
+#include "host/core/LibIscsi.h"
 #include "host/core/PipeSignalBlock.h"
 #include "host/peer/Address.h"
 #include "host/target/Portals.h"
@@ -11,7 +12,6 @@
 #include "platform/replication.h"
 
 #include <cerrno>
-#include <iscsi/iscsi.h>
 #include <memory>
 #include <vector>
 
@@ -25,7 +25,7 @@ constexpr int limit_seconds = 10;
 int checkPortal(const std::string &portal)
 {
     const PipeSignalBlock block;
-    const std::unique_ptr<iscsi_context, decltype(&iscsi_destroy_context)> context(
+    const std::unique_ptr<iscsi_context, decltype(iscsi_destroy_context)> context(
         iscsi_create_context("iqn.2001-01.norv:check"), iscsi_destroy_context);
     if (!context)
         return fail(NORV_ERR_OUT_OF_MEMORY, "no memory for a connection");

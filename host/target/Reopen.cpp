@@ -1,6 +1,7 @@
 #include "host/target/Reopen.h"
 
 #include "host/core/LastError.h"
+#include "host/core/LibIscsi.h"
 #include "host/core/PipeSignalBlock.h"
 #include "host/storage/LunStore.h"
 #include "host/target/Wait.h"
@@ -11,7 +12,6 @@
 #include <cstdio>
 #include <cstring>
 #include <fcntl.h>
-#include <iscsi/iscsi.h>
 #include <memory>
 #include <sys/socket.h>
 #include <vector>

@@ -1,6 +1,7 @@
 #include "host/transfer/Sending.h"
 
 #include "host/core/LastError.h"
+#include "host/core/LibIscsi.h"
 #include "host/core/PipeSignalBlock.h"
 
 #include <algorithm>
@@ -9,8 +10,6 @@
 #include <cstring>
 #include <deque>
 #include <fcntl.h>
-#include <iscsi/iscsi.h>
-#include <iscsi/scsi-lowlevel.h>
 #include <memory>
 #include <poll.h>
 #include <sys/mman.h>
