@@ -166,7 +166,7 @@ void addSend(Commands &commands, CLI::App &noun)
     addPositional(verb, "SNAPSHOT", *snapshot, SNAPSHOT_HELP);
     addText(verb, "--address", "ADDRESS", a->input, "address", "Data address of the peer (the one that it gives)");
     addNumber(verb, "--port", a->input, "port", "Port of the data address (the one that the peer gives)");
-    addFlag(verb, "--encrypted", a->input, "encrypted", "Send inside TLS");
+    addFlag(verb, "--encrypted", a->input, "encrypted", "Send inside TLS; the port is then that of TLS");
     addWatch(verb, a->watch);
     addJson(verb, a->json);
 }

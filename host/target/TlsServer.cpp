@@ -137,10 +137,7 @@ std::string tlsProblem()
 {
     if (tlsProcess() > 0)
         return "";
-    if (requireStunnel() != 0)
-        return "stunnel is not installed";
-    const std::string said = complaint();
-    return "stunnel does not run" + (said.empty() ? "" : ": " + said);
+    return requireStunnel() != 0 ? "stunnel is not installed" : "stunnel does not run: the system log says why";
 }
 
 } // namespace norvhost
