@@ -12,6 +12,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <memory>
+#include <sys/mman.h>
 
 using namespace norvhost;
 
@@ -52,11 +53,15 @@ int NORViSCSILunConfigGetAll(_tag_iscsi_lun_ **luns, size_t *count)
 {
     if (!luns || !count)
         return missingArgument(__func__);
-    // Room for all there can be; what is not written costs nothing.
+    // Room for all there can be; what is not written costs nothing. In huge pages where the system has them: faults on
+    // a thousand small ones take an eighth of a full listing's time.
+    constexpr size_t huge_page = 2 << 20;
+    constexpr size_t room = (NORV_LUN_ID_MAX * sizeof(_tag_iscsi_lun_) + huge_page - 1) / huge_page * huge_page;
     std::unique_ptr<_tag_iscsi_lun_, decltype(&free)> all(
-        static_cast<_tag_iscsi_lun_ *>(malloc(NORV_LUN_ID_MAX * sizeof(_tag_iscsi_lun_))), free);
+        static_cast<_tag_iscsi_lun_ *>(aligned_alloc(huge_page, room)), free);
     if (!all)
         return fail(NORV_ERR_OUT_OF_MEMORY, "no memory for the LUN records");
+    madvise(all.get(), room, MADV_HUGEPAGE);
     size_t found = 0;
     if (int err = mendRestores())
         return err;

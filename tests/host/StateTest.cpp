@@ -2,11 +2,13 @@
 
 #include "host/state/Database.h"
 #include "host/state/Schema.h"
+#include "iscsihost/read_view.h"
 
 #include <filesystem>
 #include <fstream>
 #include <sqlite3.h>
 #include <sys/stat.h>
+#include <thread>
 #include <unistd.h>
 
 namespace norvhost {
@@ -104,6 +106,21 @@ TEST_F(StateTest, ManyProcessesOpenAndWriteAtOnce)
     for (pid_t writer : writers)
         EXPECT_EQ(0, waitForChild(writer));
     EXPECT_EQ("120", setting("sum"));
+}
+
+TEST_F(StateTest, AViewShowsOneMoment)
+{
+    const auto setElsewhere = [](const char *value) {
+        std::thread([=] { EXPECT_EQ(0, setSetting("key", value)); }).join();
+    };
+    setElsewhere("1");
+    {
+        const iscsihost::ReadView view;
+        EXPECT_EQ("1", setting("key"));
+        setElsewhere("2");
+        EXPECT_EQ("1", setting("key"));
+    }
+    EXPECT_EQ("2", setting("key"));
 }
 
 TEST_F(StateTest, CommittedIsThereAfterKill)

@@ -1,6 +1,7 @@
 #include "webapi/handlers/Handlers.h"
 
 #include "iscsihost/host.h"
+#include "iscsihost/read_view.h"
 #include "iscsihost/replication.h"
 #include "iscsiwebapi/ISCSIErrorCode.h"
 #include "iscsiwebapi/ISCSILIBLUN.h"
@@ -124,11 +125,14 @@ Result listSnapshots(const Request &request)
             return bad;
     }
     std::vector<ISCSISnapshotInfo> snapshots;
-    if (int err = lun.listSnapshot(snapshots, ALL_FACTS))
-        return failed(err);
     std::map<int, std::string> names;
-    if (int err = lunNames(names))
-        return failed(err);
+    {
+        const iscsihost::ReadView view;
+        if (int err = lun.listSnapshot(snapshots, ALL_FACTS))
+            return failed(err);
+        if (int err = lunNames(names))
+            return failed(err);
+    }
     Result result;
     result.value = Json::arrayValue;
     for (const ISCSISnapshotInfo &snapshot : snapshots) {
