@@ -138,12 +138,14 @@ class Tls(ReplicationTest):
 
         # Who has no key, but a certificate.
         run("openssl", "req", "-new", "-x509", "-nodes", "-subj", "/CN=two", "-keyout", "/tmp/key.pem", "-out", "/tmp/cert.pem")
-        with subprocess.Popen(["openssl", "s_server", "-accept", f"{BRIDGE_ADDRESS}:3263", "-cert", "/tmp/cert.pem", "-key",
-                               "/tmp/key.pem", "-tls1_3", "-quiet"], stdin=subprocess.PIPE, stdout=subprocess.PIPE,
-                              stderr=subprocess.DEVNULL) as stranger:
+        stranger = subprocess.Popen(["openssl", "s_server", "-accept", f"{BRIDGE_ADDRESS}:3263", "-cert", "/tmp/cert.pem", "-key",
+                                     "/tmp/key.pem", "-tls1_3", "-quiet"], stdin=subprocess.PIPE, stdout=subprocess.PIPE,
+                                    stderr=subprocess.DEVNULL)
+        try:
             self.refuse_encrypted(snapshot, "--address", BRIDGE_ADDRESS, says="192.0.2.1:3263: the TLS handshake failed")
+        finally:
             stranger.kill()
-            self.assertEqual(stranger.stdout.read(), b"", "it was told nothing")
+        self.assertEqual(stranger.communicate()[0], b"", "it was told nothing")
         self.send_encrypted(snapshot)
         self.expect_replica(snapshot)
 
