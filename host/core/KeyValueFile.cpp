@@ -36,6 +36,9 @@ int readWhole(const char *path, std::string &text)
 {
     // Non-blocking: what lies there need not be a file.
     const FileDescriptor file(open(path, O_RDONLY | O_NONBLOCK | O_CLOEXEC));
+    // Callers look into files that need not be there, also to tell what became of a failure: its reason stays.
+    if (!file && errno == ENOENT)
+        return -ENOENT;
     struct stat status;
     if (!file || fstat(file.get(), &status) != 0)
         return refuse(errno, path);

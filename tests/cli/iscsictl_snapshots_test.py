@@ -6,6 +6,7 @@ import os
 import pty
 import pwd
 import re
+import shutil
 import signal
 import subprocess
 import sys
@@ -251,6 +252,16 @@ class Snapshots(Appliance):
         numbers = [json.loads(follower.stdout.readline())["number"] for _ in range(3)]
         self.assertEqual(numbers, [0x13000027, 0x13000037, 0x13d0000b])
         self.assertEqual(len(self.ok("events", "--last", "2").splitlines()), 2)
+
+    def test_failures_are_events(self):
+        self.take("--name", "one")
+        shutil.rmtree(glob.glob(self.volume + "/@Snapshot/*_one")[0])
+        self.fails(1, "snapshot", "restore", "vm_one", "--yes", says=r"\(\d+\): .*is not there")
+        self.fails(1, "snapshot", "clone", "vm_one", "copy", says=r"\(\d+\): .*is not there")
+        self.assertEqual([event["number"] for event in json.loads(self.ok("events", "--json"))],
+                         [0x13d00005, 0x13000027, 0x13000038, 0x13d0000c])
+        self.assertEqual(json.loads(self.ok("snapshot", "show", "vm_one", "--json"))["status"], "Unhealthy")
+        self.ok("snapshot", "delete", "vm_one", "--yes")
 
     def test_words(self):
         for args, says in ((["snapshot", "take"], "LUN"), (["snapshot", "delete"], "SNAPSHOT"),

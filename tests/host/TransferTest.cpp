@@ -265,6 +265,24 @@ TEST_F(TransferTest, FoldersThatAreNotExportedTo)
     expectConsistent();
 }
 
+TEST_F(TransferTest, AReadOnlyVolumeIsExportedFromAndTakesNothing)
+{
+    const _tag_iscsi_lun_ lun = filled("a", 1);
+    const _tag_iscsi_snapshot_ snapshot = take(lun, "s");
+    writeData(dataPath(lun), 2, lun.size);
+    const size_t before = digest(dataPath(lun));
+    run({"mount", "-o", "remount,ro", volume});
+    exportTo(snapshot, elsewhere("export"));
+    EXPECT_EQ(digest(snapshotDataPath(snapshot)), digest(elsewhere("export/export.data")));
+    EXPECT_EQ(NORV_ERR_NO_PERMISSION, startExport(snapshot, volume + "/export")) << iscsi_host_last_error();
+    EXPECT_EQ("none", progress(snapshot));
+    EXPECT_EQ(NORV_ERR_NO_PERMISSION, NORViSCSILunImport(&lun, elsewhere("export").c_str())) << iscsi_host_last_error();
+    run({"mount", "-o", "remount,rw", volume});
+    EXPECT_EQ(before, digest(dataPath(lun)));
+    EXPECT_FALSE(isLocked(lun));
+    expectConsistent();
+}
+
 TEST_F(TransferTest, ProgressIsNotWrittenWhereOthersCouldLeadIt)
 {
     const _tag_iscsi_snapshot_ snapshot = take(filled("a", 1), "s");

@@ -38,8 +38,8 @@ Result describe(const std::string &uuid)
         return failed(err);
     result.value["lun_name"] = lun.name;
     unsigned long long done = 0, total = 0;
-    if (int err = snapshot.loadSyncProgress(done, total))
-        return failed(err);
+    if (snapshot.loadSyncProgress(done, total))
+        done = total = 0; // its data is missing, which "status" tells: it can be shown and deleted all the same
     result.value["sync_progress"] = static_cast<Json::UInt64>(done < total ? done : 0);
     int loaded_number = 0;
     if (int err = iscsihost::snapshotLunNumber(uuid, loaded_number))
