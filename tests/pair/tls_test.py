@@ -18,6 +18,11 @@ STUNNEL = "/usr/bin/stunnel4"
 ETH_P_ALL = 3
 
 
+def is_listening(address, port):
+    with socket.socket() as probe:
+        return probe.connect_ex((address, port)) == 0
+
+
 class Wire:
     """While it is entered: what passes between the two appliances."""
 
@@ -138,10 +143,11 @@ class Tls(ReplicationTest):
 
         # Who has no key, but a certificate.
         run("openssl", "req", "-new", "-x509", "-nodes", "-subj", "/CN=two", "-keyout", "/tmp/key.pem", "-out", "/tmp/cert.pem")
-        stranger = subprocess.Popen(["openssl", "s_server", "-accept", f"{BRIDGE_ADDRESS}:3263", "-cert", "/tmp/cert.pem", "-key",
+        stranger = subprocess.Popen(["openssl", "s_server", "-accept", f"{BRIDGE_ADDRESS}:{TLS_PORT}", "-cert", "/tmp/cert.pem", "-key",
                                      "/tmp/key.pem", "-tls1_3", "-quiet"], stdin=subprocess.PIPE, stdout=subprocess.PIPE,
                                     stderr=subprocess.DEVNULL)
         try:
+            wait_until(lambda: is_listening(BRIDGE_ADDRESS, TLS_PORT), "the stranger listens")
             self.refuse_encrypted(snapshot, "--address", BRIDGE_ADDRESS, says="192.0.2.1:3263: the TLS handshake failed")
         finally:
             stranger.kill()
