@@ -27,6 +27,8 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 
+// Short actions are seen to end soon, long ones are not asked about all the time.
+constexpr long FIRST_LOOK_NS = 20'000'000;
 constexpr long LOOK_INTERVAL_NS = 200'000'000;
 
 volatile sig_atomic_t interrupted = 0;
@@ -54,14 +56,16 @@ public:
     }
 
     /// Waits a moment, or until there is something to read; true when there is.
-    bool pause(int fd) const
+    bool pause(int fd)
     {
         pollfd readable = {fd, POLLIN, 0}; // a negative one is none
-        const timespec moment = {0, LOOK_INTERVAL_NS};
+        const timespec moment = {0, interval};
+        interval = std::min(2 * interval, LOOK_INTERVAL_NS);
         return ppoll(&readable, 1, &moment, &before_mask) > 0;
     }
 
 private:
+    long interval = FIRST_LOOK_NS;
     sigset_t before_mask;
     struct sigaction before_action;
 };
@@ -280,7 +284,7 @@ Progress askEarly(const Action &action)
 
 Json::Value watch(const Action &action)
 {
-    const HeldInterrupt interrupt;
+    HeldInterrupt interrupt;
     Meter meter(action.title);
     meter.show({});
     BackgroundRequest request(action, interrupt);
