@@ -111,7 +111,9 @@ class RemoteClone(PairTest):
         write(self.one, "written", "/tmp/noise")
         run("qemu-io", "--image-opts", image(self.one, "written"), stdin="".join(f"write -q -P 0 {place * gap} 4k\n" for place in range(places)))
         with open("/tmp/rounds", "w", encoding="ascii") as script:
-            script.writelines(f"write -q -P {number} {place * gap} 4k\n" for number in range(1, 250) for place in range(places))
+            for number in range(1, 250):
+                script.writelines(f"write -q -P {number} {place * gap} 4k\n" for place in range(places))
+                script.write("sleep 40\n")  # or a quick disk would have them all before the clone ends
         with open("/tmp/rounds", encoding="ascii") as script:
             writer = subprocess.Popen(["qemu-io", "--image-opts", image(self.one, "written")], stdin=script,
                                       stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL)
