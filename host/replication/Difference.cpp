@@ -209,10 +209,27 @@ int describeWhole(int file, uint64_t size, std::vector<DataRange> &ranges)
 
 uint64_t dataBytes(const std::vector<DataRange> &ranges)
 {
+    return dataBelow(ranges, UINT64_MAX);
+}
+
+uint64_t dataBelow(const std::vector<DataRange> &ranges, uint64_t place)
+{
     uint64_t bytes = 0;
     for (const DataRange &range : ranges)
-        bytes += range.zeros ? 0 : range.length;
+        if (!range.zeros && range.offset < place)
+            bytes += std::min(range.length, place - range.offset);
     return bytes;
+}
+
+std::vector<DataRange> rangesFrom(const std::vector<DataRange> &ranges, uint64_t place)
+{
+    std::vector<DataRange> left;
+    for (const DataRange &range : ranges) {
+        const uint64_t end = range.offset + range.length, begin = std::max(range.offset, place);
+        if (begin < end)
+            left.push_back({begin, end - begin, range.zeros});
+    }
+    return left;
 }
 
 } // namespace norvhost

@@ -20,4 +20,10 @@ int describeWhole(int file, uint64_t size, std::vector<DataRange> &ranges);
 /// Bytes of data in them.
 uint64_t dataBytes(const std::vector<DataRange> &ranges);
 
+/// The same of what lies below a place.
+uint64_t dataBelow(const std::vector<DataRange> &ranges, uint64_t place);
+
+/// What of them lies behind it.
+std::vector<DataRange> rangesFrom(const std::vector<DataRange> &ranges, uint64_t place);
+
 } // namespace norvhost

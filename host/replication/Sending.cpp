@@ -43,9 +43,8 @@ constexpr uint64_t UNIT = 512; // what is said to be sent where nothing differs
 constexpr int FINAL = -EPROTO; // trying again is of no use, and nobody does
 constexpr unsigned EVENT_DESTINATION = 0x13d0000d;
 
-/// After so much, or so long, what was sent is flushed, so that it needs not be sent again.
-constexpr uint64_t FLUSH_INTERVAL = 256 << 20;
-constexpr auto FLUSH_PERIOD = std::chrono::seconds(5);
+/// How often the peer is told how far it has been flushed, so that it needs not be sent again.
+constexpr auto NOTE_INTERVAL = std::chrono::seconds(5);
 
 std::string lockName(const char *task_uuid)
 {
@@ -147,7 +146,7 @@ private:
     int outcome(int err) const;
     int describe(const Json::Value &reception);
     int sendAll(const OpenSink &sink);
-    int note(uint64_t offset);
+    int note(uint64_t place);
     int tell(uint64_t moved);
     std::string arrivalPath() const { return std::string("/replications/") + task.record.uuid + "/arrival"; }
 
@@ -159,10 +158,11 @@ private:
     FileDescriptor file, base_file;
     PairedNode peer;
     std::vector<DataRange> ranges;
-    uint64_t total = 0, moved_before = 0, offset = 0;
+    uint64_t total = 0, moved_before = 0;
+    uint64_t offset = 0; ///< what lies below it is flushed on the peer, which knows
     bool to_zeros = false;
     bool was_full = false; ///< the peer's volume, when it was tried last
-    Clock::time_point told{};
+    Clock::time_point told{}, noted{};
 };
 
 int findByVersion(int lid, const std::string &version, SnapshotRow &row)
@@ -298,62 +298,52 @@ int Sender::describe(const Json::Value &reception)
                       : findDifference(from_base ? base_file.get() : -1, file.get(), size, ranges))
         return err;
     total = std::max(dataBytes(ranges), UNIT);
-    for (const DataRange &range : ranges)
-        if (!range.zeros && range.offset < offset)
-            moved_before += std::min(range.length, offset - range.offset);
+    moved_before = dataBelow(ranges, offset);
     return tell(0);
 }
 
 int Sender::sendAll(const OpenSink &sink)
 {
-    size_t at = 0;
-    while (at < ranges.size() && ranges[at].offset + ranges[at].length <= offset)
-        ++at;
-    while (at < ranges.size()) {
-        uint64_t budget = FLUSH_INTERVAL;
-        const auto limit = Clock::now() + FLUSH_PERIOD;
-        norvhost::Sending sending;
-        sending.to = sink.unit();
-        sending.from = file.get();
-        sending.to_zeros = to_zeros;
-        sending.progress = [&](uint64_t moved) { return tell(moved); };
-        sending.next = [&](DataRange &range) {
-            range = {};
-            if (at == ranges.size() || budget == 0 || Clock::now() > limit)
-                return 0;
-            const DataRange &whole = ranges[at];
-            range = whole;
-            range.offset = std::max(whole.offset, offset);
-            range.length = whole.offset + whole.length - range.offset;
-            if (!range.zeros) {
-                range.length = std::min(range.length, budget);
-                budget -= range.length;
-            }
-            offset = range.offset + range.length;
-            if (offset == whole.offset + whole.length)
-                ++at;
-            return 0;
-        };
-        if (int err = sendRanges(sending))
-            return sink.explain(err);
-        moved_before += FLUSH_INTERVAL - budget;
-        if (int err = note(offset))
+    const std::vector<DataRange> left = rangesFrom(ranges, offset);
+    if (left.empty())
+        return 0;
+    auto next = left.begin();
+    uint64_t flushed = offset;
+    noted = Clock::now();
+    norvhost::Sending sending;
+    sending.to = sink.unit();
+    sending.from = file.get();
+    sending.to_zeros = to_zeros;
+    sending.next = [&](DataRange &range) {
+        range = next == left.end() ? DataRange() : *next++;
+        return 0;
+    };
+    sending.flushed = [&](uint64_t place) { flushed = place; };
+    sending.progress = [&](uint64_t moved) {
+        const bool due = flushed > offset && Clock::now() - noted > NOTE_INTERVAL;
+        // A web server that is away for a moment is no reason to stop: the next note says it too.
+        if (int err = due ? note(flushed) : 0; err && err != NORV_ERR_SEND_REQUEST)
             return err;
-    }
-    return 0;
+        return tell(moved);
+    };
+    if (int err = sendRanges(sending))
+        return sink.explain(err);
+    return note(snapshot.record.total_size);
 }
 
 /// What lies below the place is flushed on the peer.
-int Sender::note(uint64_t flushed)
+int Sender::note(uint64_t place)
 {
     Json::Value body(Json::objectValue), answer;
     body["version"] = snapshot.record.version;
-    body["offset"] = Json::UInt64(flushed);
-    body["moved"] = Json::UInt64(moved_before);
+    body["offset"] = Json::UInt64(place);
+    body["moved"] = Json::UInt64(dataBelow(ranges, place));
     body["total"] = Json::UInt64(total);
+    noted = Clock::now();
     if (int err = askNode(peer, "PATCH", arrivalPath(), body, answer))
         return err;
-    return tell(0);
+    offset = place;
+    return 0;
 }
 
 int Sender::tell(uint64_t moved)

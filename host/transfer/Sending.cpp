@@ -38,8 +38,10 @@ constexpr auto login_limit = 15s, stall_limit = 60s, flush_limit = 600s, logout_
 constexpr auto progress_interval = 100ms;
 constexpr int keepalive_seconds = 10, keepalive_count = 3;
 
-/// What is written between two flushes, which make the unit's disk work along: the last one has little to wait for.
+/// What is written between two flushes, which make the unit's disk work along: the last one has little to wait for. On
+/// a slow line time passes first.
 constexpr uint64_t flush_step = 64 << 20;
+constexpr auto flush_interval = 5s;
 
 /// Commands that are begun before the connection is served again.
 constexpr int issues_at_once = 8;
@@ -157,7 +159,7 @@ private:
     uint64_t moved = 0, capacity = 0;
     uint64_t written = 0; ///< since the latest flush began
     bool flushing = false;
-    Clock::time_point last_movement, last_told;
+    Clock::time_point last_movement, last_flush, last_told;
     bool answer_came = false, ending = false;
     int answer_status = 0, failure = 0;
     std::string answer_text;
@@ -237,7 +239,7 @@ int Sender::checkUnit()
 
 int Sender::stream()
 {
-    last_movement = Clock::now();
+    last_movement = last_flush = Clock::now();
     for (;;) {
         if (int err = plan())
             return err;
@@ -246,7 +248,8 @@ int Sender::stream()
             return 0;
         // In small portions: the connection is to be served meanwhile. Zeros may need a request of their own.
         bool busy = false;
-        if (!flushing && written >= flush_step && idle.size() >= 2)
+        const bool flush_due = written >= flush_step || (written > 0 && Clock::now() - last_flush > flush_interval);
+        if (!flushing && flush_due && idle.size() >= 2)
             if (int err = beginFlush())
                 return err;
         for (int i = 0; i < issues_at_once && idle.size() >= 2 && !(planned.empty() && gathered.length == 0); ++i) {
@@ -383,6 +386,7 @@ int Sender::beginFlush()
     Request *const request = takeRequest(place);
     request->flushes = true;
     flushing = true;
+    last_flush = Clock::now();
     written = 0;
     return began(request, iscsi_synchronizecache16_task(session.get(), sending.to.lun, 0, 0, 0, 0, ended, request));
 }

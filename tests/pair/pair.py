@@ -3,6 +3,7 @@
 Works inside demo/world.sh only, whose installed build, processes and network it uses: the world is the third machine, where
 initiators run, at 192.0.2.1. Everything ends with the world.
 """
+import contextlib
 import json
 import os
 import re
@@ -193,10 +194,11 @@ class Appliance(Machine):
         stays = self.processes("sleep") + [self.pid]
 
         def nothing_runs():
-            killed = [pid for pid in self.processes() if pid not in stays]
-            for pid in killed:
-                os.kill(pid, signal.SIGKILL)
-            return not killed
+            runs = [pid for pid in self.processes() if pid not in stays]
+            for pid in runs:
+                with contextlib.suppress(ProcessLookupError):
+                    os.kill(pid, signal.SIGKILL)
+            return not runs
 
         wait_until(nothing_runs, f"nothing runs on {self.name}")
         self.run("xfs_io", "-x", "-c", "shutdown", VOLUME)

@@ -31,8 +31,8 @@ class ReplicationTest(PairTest):
             appliance.iscsictl("lun", "unmap", self.lun, "data", check=False)
             appliance.iscsictl("replication", "remove", self.task, "--delete-lun", check=False)
 
-    def slow(self):
-        run("tc", "qdisc", "replace", "dev", self.two.name, "root", "tbf", "rate", SLOW, "burst", "256k", "latency", "100ms")
+    def slow(self, rate=SLOW):
+        run("tc", "qdisc", "replace", "dev", self.two.name, "root", "tbf", "rate", rate, "burst", "256k", "latency", "100ms")
 
     def full_speed(self):
         run("tc", "qdisc", "del", "dev", self.two.name, "root", check=False)
@@ -71,10 +71,10 @@ class ReplicationTest(PairTest):
         for fact in ("name", "version", "description", "taken_by", "snapshot_time", "is_app_consistent", "is_user_locked", "total_size"):
             self.assertEqual(there[0][fact], here[fact], fact)
 
-    def begin(self, name="disturbed", after_mib=4):
+    def begin(self, name="disturbed", after_mib=4, rate=SLOW):
         """A slow sending of a new snapshot, with data on its way; the snapshot."""
         snapshot = self.take(name)
-        self.slow()
+        self.slow(rate)
         self.one.iscsictl("replication", "send", self.task, snapshot)
         wait_until(lambda: self.sending()["sent_size"] > after_mib * MIB, "data flows")
         self.assertTrue(self.sending()["is_locked"])

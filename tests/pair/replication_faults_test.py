@@ -7,13 +7,14 @@ import sqlite3
 import subprocess
 import time
 
-from cases import MIB, checksum_at, image, main
+from cases import MIB, checksum, checksum_at, image, main
 from pair import VOLUME, is_alive, run, wait_until
 from replication_cases import SIZE_MIB, ReplicationTest
 
 LONG = bool(os.environ.get("ISCSIWEBAPI_LONG"))
 KILLS = 120 if LONG else 12
 CUTS = (1, 10, 60) if LONG else (1, 10)
+SLOWER = "40mbit"  # there is time to flush
 READ_WRITE, READ_ONLY = 3261, 3262
 
 
@@ -115,7 +116,8 @@ class Faults(ReplicationTest):
                 self.change_much(dice)
                 snapshot = self.take(f"round {round_}")
                 self.slow()
-                start = self.one.start("iscsictl", "replication", "send", self.task, snapshot, stdout=subprocess.DEVNULL)
+                start = self.one.start("iscsictl", "replication", "send", self.task, snapshot,
+                                       stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL)
                 time.sleep(dice.uniform(0, 2))  # the moment, not a wait
                 kills += self.killed(victims[victim]())
                 self.full_speed()
@@ -133,7 +135,7 @@ class Faults(ReplicationTest):
 
     def test_retried(self):
         """A sending that fails goes on by itself, from where its data was flushed."""
-        snapshot = self.begin()
+        snapshot = self.begin(rate=SLOWER)
         wait_until(lambda: self.arrived() > 0, "some of it is flushed", 60)
         flushed = self.arrived()
         self.killed(self.senders())
@@ -160,7 +162,7 @@ class Faults(ReplicationTest):
                 self.expect_whole(snapshot)
 
     def test_peer_restarted(self):
-        snapshot = self.begin()
+        snapshot = self.begin(rate=SLOWER)
         wait_until(lambda: self.arrived() > 0, "some of it is flushed", 60)
         self.two.restart()
         flushed = self.arrived()
@@ -169,6 +171,20 @@ class Faults(ReplicationTest):
         received = self.two.received_bytes()
         self.expect_whole(snapshot)
         self.assertLess(self.two.received_bytes() - received, (SIZE_MIB + 2) * MIB - flushed)
+        self.two.restart()
+        self.assertEqual(self.replica(), checksum("/tmp/data"), "what was sent has come to stay")
+        self.change(self.one, 9, 64, 0x99)
+        self.assertEqual(self.send(self.take("more")), 64 << 10)
+
+    def test_source_restarted(self):
+        """What its LUN had not flushed may be gone; its snapshots are whole."""
+        snapshot = self.begin()
+        self.one.restart()
+        self.assertRegex(self.one.iscsictl("replication", "status", self.task), "killed")
+        self.full_speed()
+        self.expect_unlocked()
+        self.send(snapshot)
+        self.assertEqual(self.replica(), checksum("/tmp/data"))
 
     def test_volume_full(self):
         """While data arrives, and when only the snapshot is left to take."""
@@ -181,6 +197,15 @@ class Faults(ReplicationTest):
         self.assertIn("Out of volume space", self.one.iscsictl("events"))
         self.give_up()
         self.two.iscsictl("lun", "delete", "fat", "--yes")
+        self.expect_whole(snapshot)
+
+        self.two.run("sh", "-c", f"for size in 1048576 65536 4096; do while head -c $size /dev/zero >>{VOLUME}/filler; do :; done; done 2>&1")
+        snapshot = self.take("no more")
+        self.one.iscsictl("replication", "send", self.task, snapshot)
+        wait_until(lambda: self.sending()["error"], "the sending fails", 60)
+        self.assertEqual(self.sending()["error"], 18990002)
+        self.give_up()
+        self.two.run("rm", f"{VOLUME}/filler")
         self.expect_whole(snapshot)
 
     def test_too_many_snapshots(self):
@@ -270,7 +295,7 @@ class Faults(ReplicationTest):
     def test_removed_while_sending(self):
         snapshot = self.begin()
         self.two.iscsictl("replication", "remove", self.task, "--delete-lun")
-        self.assertEqual(self.two.json("lun", "list"), [])
+        self.assertNotIn(self.lun, [lun["name"] for lun in self.two.json("lun", "list")])
         self.give_up()
         self.refused(self.one, "replication", "send", self.task, snapshot, says="18990810")
 
