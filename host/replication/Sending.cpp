@@ -148,6 +148,7 @@ private:
     int sendAll(const OpenSink &sink);
     int note(uint64_t place);
     int tell(uint64_t moved);
+    int checkStop() const;
     std::string arrivalPath() const { return std::string("/replications/") + task.record.uuid + "/arrival"; }
 
     NamedLock lock;
@@ -273,6 +274,8 @@ int Sender::send()
         return err;
     if (int err = sendAll(sink))
         return err == -EIO ? refused(sink) : err;
+    if (int err = checkStop())
+        return err;
     if (int err = sink.close(true))
         return err;
     Json::Value end(Json::objectValue);
@@ -346,17 +349,22 @@ int Sender::note(uint64_t place)
     return 0;
 }
 
+int Sender::checkStop() const
+{
+    bool stop = false;
+    if (int err = stopRequested(task.record.uuid, stop))
+        return err;
+    return stop ? fail(STOPPED, "the sending was stopped") : 0;
+}
+
 int Sender::tell(uint64_t moved)
 {
     const auto now = Clock::now();
     if (now - told < std::chrono::milliseconds(500))
         return 0;
     told = now;
-    bool stop = false;
-    if (int err = stopRequested(task.record.uuid, stop))
+    if (int err = checkStop())
         return err;
-    if (stop)
-        return fail(STOPPED, "the sending was stopped");
     // Until the peer has made the state its own, one byte is left.
     task.progress.sent_size = std::min(moved_before + moved, total - 1);
     task.progress.send_total_size = total;
