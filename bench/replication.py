@@ -21,6 +21,7 @@ def wait_sent(one, task):
             raise SystemExit(f"the sending failed: {status}")
         if status["sent_size"] == status["send_total_size"] != 0:
             return status
+        time.sleep(0.02)  # asking takes a processor too
 
 
 def wait_idle(one, task):
@@ -123,8 +124,8 @@ class Btrfs:
     def __init__(self, one, two, size):
         self.one, self.two, self.number = one, two, 0
         for appliance in (one, two):
-            appliance.run("sh", "-c", f"mkdir -p {BTRFS} && truncate -s {size} /var/lib/iscsi-host/btrfs.img && "
-                                      f"mkfs.btrfs -q /var/lib/iscsi-host/btrfs.img && mount -o loop /var/lib/iscsi-host/btrfs.img {BTRFS}")
+            appliance.run("sh", "-c", f"mkdir -p {BTRFS} && truncate -s {size} /tmp/btrfs.img && "
+                                      f"mkfs.btrfs -q /tmp/btrfs.img && mount -o loop /tmp/btrfs.img {BTRFS}")
         one.run("btrfs", "subvolume", "create", f"{BTRFS}/data")
 
     def send(self):
@@ -143,7 +144,7 @@ class Btrfs:
 
     def stop(self):
         for appliance in (self.one, self.two):
-            appliance.run("sh", "-c", f"umount {BTRFS} && rm /var/lib/iscsi-host/btrfs.img")
+            appliance.run("sh", "-c", f"umount {BTRFS} && rm /tmp/btrfs.img")
 
 
 def full(one, two, size):
