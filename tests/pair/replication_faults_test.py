@@ -199,13 +199,15 @@ class Faults(ReplicationTest):
         self.two.iscsictl("lun", "delete", "fat", "--yes")
         self.expect_whole(snapshot)
 
-        self.two.run("sh", "-c", f"for size in 1048576 65536 4096; do while head -c $size /dev/zero >>{VOLUME}/filler; do :; done; done 2>&1")
+        filler = f"{VOLUME}/filler"
+        self.two.run("sh", "-c", f"touch {filler}; for size in 67108864 1048576 4096; do"
+                     f" while fallocate --offset $(stat --format %s {filler}) --length $size {filler}; do :; done; done 2>/dev/null")
         snapshot = self.take("no more")
         self.one.iscsictl("replication", "send", self.task, snapshot)
         wait_until(lambda: self.sending()["error"], "the sending fails", 60)
         self.assertEqual(self.sending()["error"], 18990002)
         self.give_up()
-        self.two.run("rm", f"{VOLUME}/filler")
+        self.two.run("rm", filler)
         self.expect_whole(snapshot)
 
     def test_too_many_snapshots(self):
