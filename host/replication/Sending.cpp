@@ -125,6 +125,17 @@ private:
     bool is_open = false;
 };
 
+/// Whether the peer has no task any more that takes it.
+bool isFinal(int err)
+{
+    return err == NORV_ERR_NOT_A_DESTINATION_TASK || err == NORV_ERR_NO_SUCH_TASK;
+}
+
+int codeToStore(int err)
+{
+    return err == -ENOSPC ? NORV_ERR_OUT_OF_SPACE : isFinal(err) ? FINAL : err;
+}
+
 /// One sending: prepared in the caller's process, carried out in a worker.
 class Sender {
 public:
@@ -142,8 +153,7 @@ public:
 
 private:
     int send();
-    int refused(OpenSink &sink) const;
-    int outcome(int err) const;
+    int findCause(OpenSink &sink, int err);
     int describe(const Json::Value &reception);
     int sendAll(const OpenSink &sink);
     int note(uint64_t place);
@@ -224,7 +234,7 @@ int Sender::prepare(const _tag_iscsi_task_ &wanted, const char *snapshot_uuid, c
 
 void Sender::run()
 {
-    task.progress.error = outcome(send());
+    task.progress.error = codeToStore(send());
     if (task.progress.error && task.progress.error != STOPPED) {
         const std::string reason = lastError();
         syslog(LOG_ERR, "sending the snapshot '%s' failed: %s", snapshot.record.name, reason.c_str());
@@ -235,28 +245,17 @@ void Sender::run()
     updateProgress(task.progress);
 }
 
-/// The code to store.
-int Sender::outcome(int err) const
-{
-    switch (err) {
-    case -ENOSPC:
-        return NORV_ERR_OUT_OF_SPACE;
-    case NORV_ERR_NOT_A_DESTINATION_TASK:
-    case NORV_ERR_NO_SUCH_TASK:
-        return FINAL;
-    default:
-        return err;
-    }
-}
-
-/// The peer could not write: it knows whether its volume is full, which its unit does not tell.
-int Sender::refused(OpenSink &sink) const
+/// The connection or its unit failed: the peer's web API knows why.
+int Sender::findCause(OpenSink &sink, int err)
 {
     const std::string reason = lastError();
+    const int told = note(offset); // nothing new, but a peer that wants no more of it says so
+    if (isFinal(told))
+        return told;
     bool full = false;
-    if (sink.close(false, &full) == 0 && full)
+    if (err == -EIO && sink.close(false, &full) == 0 && full)
         return fail(NORV_ERR_OUT_OF_SPACE, "the peer's volume is full");
-    return fail(-EIO, "%s", reason.c_str());
+    return fail(err, "%s", reason.c_str());
 }
 
 int Sender::send()
@@ -273,7 +272,7 @@ int Sender::send()
     if (int err = sink.open(task, rod_key, route))
         return err;
     if (int err = sendAll(sink))
-        return err == -EIO ? refused(sink) : err;
+        return err < 0 && err != STOPPED ? findCause(sink, err) : err;
     if (int err = checkStop())
         return err;
     if (int err = sink.close(true))

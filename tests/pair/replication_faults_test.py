@@ -71,13 +71,13 @@ class Faults(ReplicationTest):
             wait_until(lambda: not self.sending(appliance)["is_locked"], f"the task is not locked on {appliance.name}")
             lun = appliance.json("lun", "show", self.lun)
             self.assertFalse(lun["is_action_locked"], lun)
-            for snapshot in appliance.json("snapshot", "list", self.lun):
+            for snapshot in appliance.json("snapshot", "list", self.lun)[-2:]:
                 self.assertFalse(appliance.json("snapshot", "show", snapshot["uuid"])["is_action_locked"], snapshot)
 
     def expect_whole(self, snapshot):
         """A sending of this snapshot makes the destination what the source is."""
         self.full_speed()
-        self.expect_unlocked()
+        self.wait_idle()
         self.send(snapshot)
         self.expect_unlocked()
         self.expect_replica(snapshot)
@@ -118,7 +118,7 @@ class Faults(ReplicationTest):
                 self.slow()
                 start = self.one.start("iscsictl", "replication", "send", self.task, snapshot,
                                        stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL)
-                time.sleep(dice.uniform(0, 2))  # the moment, not a wait
+                time.sleep(dice.uniform(0, 1.3))  # the moment, not a wait
                 kills += self.killed(victims[victim]())
                 self.full_speed()
                 start.wait(timeout=120)
@@ -298,7 +298,8 @@ class Faults(ReplicationTest):
         snapshot = self.begin()
         self.two.iscsictl("replication", "remove", self.task, "--delete-lun")
         self.assertNotIn(self.lun, [lun["name"] for lun in self.two.json("lun", "list")])
-        self.give_up()
+        self.wait_idle()
+        self.assertEqual(self.sending()["error"], -71, "nothing to try again")
         self.refused(self.one, "replication", "send", self.task, snapshot, says="18990810")
 
     def test_wrong_key(self):
