@@ -302,6 +302,7 @@ class WebApi(Served):
         body = json.dumps({"name": "vm", "type": 15, "location": self.volume, "size": 1 << 20})
         database = sqlite3.connect(os.path.join(self.env["ISCSI_HOST_STATE"], "state.db"), isolation_level=None)
         self.addCleanup(database.close)
+        self.wait_for(lambda: not self.programs()) # the log-ins' are not the one
         database.execute("BEGIN IMMEDIATE") # the request waits for its turn
         leaving = self.talk("POST /api/v1/luns HTTP/1.1", "Host: a", "Authorization: " + token,
                             "Content-Type: application/json", f"Content-Length: {len(body)}", "", body)
