@@ -187,7 +187,7 @@ class Faults(ReplicationTest):
         self.assertEqual(self.replica(), checksum("/tmp/data"))
 
     def test_volume_full(self):
-        """While data arrives, and when only the snapshot is left to take."""
+        """In the middle of the data, and with no room for anything."""
         free = json.loads(self.two.host("volume", "list", "--json"))[0]["free_bytes"]
         self.two.iscsictl("lun", "create", "fat", "--location", VOLUME, "--size", str((free // MIB - SIZE_MIB // 2) * MIB), "--type", "file")
         snapshot = self.take("too much")
