@@ -10,6 +10,8 @@
 #include "webapi/client/APIReplication.h"
 
 #include <algorithm>
+#include <exception>
+#include <new>
 #include <unistd.h>
 
 namespace ISCSI::LIB::LIBReplication {
@@ -35,6 +37,19 @@ int finishWork(ISCSILIBReplication &replication, int result, Site site)
     return result;
 }
 
+/// What the work returns. Nothing is thrown out of a worker: it would go on as its caller.
+template <class Work>
+int resultOf(Work work)
+{
+    try {
+        return work();
+    } catch (const std::bad_alloc &) {
+        return ERR_OUT_OF_MEMORY;
+    } catch (const std::exception &) {
+        return ERR_DEFAULT_ERROR_CODE;
+    }
+}
+
 /// Snapshots of a LUN, newest first.
 int listByTime(const std::string &lun_uuid, std::vector<ISCSISnapshotInfo> &out)
 {
@@ -42,6 +57,15 @@ int listByTime(const std::string &lun_uuid, std::vector<ISCSISnapshotInfo> &out)
         return err;
     std::sort(out.begin(), out.end(), ISCSISnapshotInfo::CompareBySnapshotTime);
     return 0;
+}
+
+/// Of the snapshot with the version. It is the version itself, but for snapshots that came from a peer which was the
+/// source before.
+std::string uuidOf(const std::string &version, const std::vector<ISCSISnapshotInfo> &snapshots)
+{
+    const auto found = std::find_if(snapshots.begin(), snapshots.end(),
+                                    [&](const ISCSISnapshotInfo &one) { return one.version == version; });
+    return found == snapshots.end() ? version : found->uuid;
 }
 
 /// One sending of one snapshot: what is decided before the fork, and what the worker needs.
@@ -75,6 +99,8 @@ public:
         if (int err = request.send())
             return fail(err, task, "Failed to get common base for sending snapshot", site);
         base = {request.baseVersion(), request.needFullSync(), request.notAligned(), ""};
+        if (!base.version.empty())
+            base_uuid = uuidOf(base.version, snapshots);
         if (base.need_full_sync)
             fail(0, task, "No base snapshot found. Need full sync", site);
         if (base.not_aligned)
@@ -144,7 +170,7 @@ private:
     int sendAgain()
     {
         sleep(RETRY_SECONDS);
-        for (const std::string &uuid : {snapshot.uuid, base.version}) {
+        for (const std::string &uuid : {snapshot.uuid, base_uuid}) {
             if (uuid.empty())
                 continue;
             if (int err = replication.waitUntilSnapshotUnlock(uuid, RETRY_SECONDS))
@@ -194,6 +220,7 @@ private:
     bool flag;
     Site site;
     Base base;
+    std::string base_uuid;
     int retries = 3;
 };
 
@@ -252,7 +279,7 @@ int ISCSILIBReplication::sendSnapshot(const std::string &snapshot_uuid, const st
         return finishWork(*this, fail(err, task, "Failed to fork process"), here());
     if (!is_child)
         return 0; // the task stays locked for the worker
-    return finishWork(*this, sending.follow(), here());
+    return finishWork(*this, resultOf([&] { return sending.follow(); }), here());
 }
 
 int ISCSILIBReplication::getBaseVersion(const std::map<std::string, ISCSISnapshotInfo> &source_snapshots,
@@ -277,7 +304,7 @@ int ISCSILIBReplication::getBaseVersion(const std::map<std::string, ISCSISnapsho
         return finishWork(*this, 0, here());
     if (!is_child)
         return 0; // the task stays locked for the worker
-    int result = waitUntilLocalLUNUnlock(RESTORE_LIMIT);
+    const int result = resultOf([&] { return waitUntilLocalLUNUnlock(RESTORE_LIMIT); });
     if (result)
         fail(result, task, "Failed to wait until LUN restoring completed");
     return finishWork(*this, result, here());

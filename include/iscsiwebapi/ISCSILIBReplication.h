@@ -12,7 +12,7 @@
 namespace ISCSI::LIB::LIBReplication {
 
 /// The texts that callers show for a task's state of synchronisation.
-inline constexpr const char *const TASK_SYNC_TEXTS[] = {
+constexpr const char *TASK_SYNC_TEXTS[] = {
     "doing sync",
     "sync done",
     "not a sink task",
