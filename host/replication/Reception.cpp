@@ -5,14 +5,19 @@
 #include "host/core/LastError.h"
 #include "host/replication/Roles.h"
 #include "host/replication/TaskStore.h"
+#include "host/storage/FileClone.h"
 #include "host/storage/LunStore.h"
 #include "host/storage/MapFile.h"
 #include "host/storage/SnapshotStore.h"
 #include "host/storage/Versions.h"
+#include "host/target/Sinks.h"
 #include "iscsihost/replication.h"
 #include "platform/error.h"
+#include "platform/iscsi_snapshot.h"
 
 #include <algorithm>
+#include <cerrno>
+#include <fcntl.h>
 #include <iterator>
 #include <string>
 #include <utility>
@@ -23,6 +28,15 @@ using iscsihost::Incoming;
 using iscsihost::Reception;
 
 namespace {
+
+/// Initiators may write to any other: it is not to be set back.
+int requireSink(const LunRow &lun)
+{
+    return lun.record.type == NORV_LUN_TYPE_SINK
+               ? 0
+               : fail(NORV_ERR_LUN_TYPE, "the LUN '%s' receives nothing any more: its replication can only be removed",
+                      lun.record.name);
+}
 
 /// A task's destination LUN.
 struct Destination {
@@ -46,6 +60,8 @@ int Destination::load(const std::string &task_uuid)
     if (task.record.is_source)
         return fail(NORV_ERR_NOT_A_DESTINATION_TASK, "the task %s is a source here", task.record.uuid);
     if (int err = loadLunByUuid(task.localLun(), lun))
+        return err;
+    if (int err = requireSink(lun))
         return err;
     path = dataPath(lun.record);
     if (int err = readVersions(path, versions))
@@ -85,17 +101,46 @@ bool goOn(const Destination &destination, const Incoming &incoming, Reception &r
     return true;
 }
 
+int isDestinationBlank(const Destination &destination, bool &blank)
+{
+    const FileDescriptor file(open(destination.path.c_str(), O_RDONLY | O_NOFOLLOW | O_CLOEXEC));
+    if (!file)
+        return failErrno(NORV_ERR_OPEN_FILE, errno, "cannot open the LUN's file %s", destination.path.c_str());
+    return isBlank(file.get(), destination.lun.record.size, blank);
+}
+
+/// The state that arrived last stays as a snapshot when the next one overwrites it: whoever sends took none, or it was
+/// deleted.
+int keepArrivedState(const Destination &destination)
+{
+    if (!isSynchronised(destination.versions) || destination.arrival.name.empty())
+        return 0;
+    std::vector<SnapshotRow> rows;
+    if (int err = loadSnapshotsOfLun(destination.lun.record.lid, rows))
+        return err;
+    if (std::any_of(rows.begin(), rows.end(), [&](const SnapshotRow &row) {
+            return row.record.version == destination.versions.base && !isInTrash(row.record);
+        }))
+        return 0;
+    _tag_iscsi_snapshot_ snapshot = {};
+    if (int err = NORViSCSIUnusedSnapshotNameFind(destination.lun.record.lid, snapshot.name, sizeof snapshot.name))
+        return err;
+    return NORViSCSISnapshotCreate(&destination.lun.record, &snapshot);
+}
+
 /// Finds out what the LUN holds, and makes that the base where it can.
 int prepare(const Destination &destination, const Incoming &incoming, Reception &reception)
 {
     const Versions &versions = destination.versions;
-    const bool touched = versions.current != versions.base;
     if (incoming.base.empty()) {
-        reception.holding = versions.base == NORV_ZERO_UUID && !touched ? Holding::zeros : Holding::unknown;
+        bool blank = false;
+        if (int err = isDestinationBlank(destination, blank))
+            return err;
+        reception.holding = blank ? Holding::zeros : Holding::unknown;
         return 0;
     }
     reception.holding = Holding::base;
-    if (versions.base == incoming.base && !touched)
+    if (versions.base == incoming.base && versions.current == versions.base)
         return 0;
     const int err = setBackTo(destination.lun, incoming.base);
     if (err != NORV_ERR_NO_SUCH_SNAPSHOT)
@@ -115,13 +160,19 @@ int iscsihost::beginReception(const std::string &task_uuid, const Incoming &inco
     // Whoever was sending before is gone: the source lets one send at a time.
     if (int err = shutSink(destination.lun.record.uuid))
         return err;
-    if (!goOn(destination, incoming, begun)) {
+    const bool arrived = isSynchronised(destination.versions) && destination.versions.base == incoming.version;
+    if (arrived) { // and the sender did not hear it
+        begun.holding = incoming.base.empty() ? Holding::unknown : Holding::base;
+        begun.offset = destination.lun.record.size;
+    } else if (!goOn(destination, incoming, begun)) {
+        if (int err = keepArrivedState(destination))
+            return err;
         if (int err = updateArrival(destination.task.record.uuid, {}))
             return err;
         if (int err = prepare(destination, incoming, begun))
             return err;
     }
-    if (begun.holding != Holding::base && destination.versions.base == incoming.version)
+    if (!arrived && begun.holding != Holding::base && destination.versions.base == incoming.version)
         if (int err = forgetBase(destination.path)) // else a part of the version would be taken for the whole
             return err;
     if (int err = updateArrival(destination.task.record.uuid,
@@ -129,7 +180,10 @@ int iscsihost::beginReception(const std::string &task_uuid, const Incoming &inco
         return err;
     if (int err = writeTransferCount(destination.path, Transfer::sending, {0, 1}))
         return err;
-    if (int err = beginSynchronisation(destination.path, incoming.version))
+    if (!arrived)
+        if (int err = beginSynchronisation(destination.path, incoming.version))
+            return err;
+    if (int err = openSinkFor(destination.lun, begun.sink))
         return err;
     reception = begun;
     return 0;
@@ -140,16 +194,26 @@ int iscsihost::breakReception(const std::string &task_uuid)
     TaskRow task;
     if (int err = loadTask(task_uuid, task))
         return err;
-    return task.record.is_source ? 0 : shutSink(task.localLun());
+    if (task.record.is_source)
+        return 0;
+    LunRow lun;
+    if (int err = loadLunByUuid(task.localLun(), lun))
+        return err;
+    if (int err = requireSink(lun))
+        return err;
+    return shutSink(lun.record.uuid);
 }
 
-int iscsihost::noteReception(const std::string &task_uuid, const std::string &version, uint64_t offset, uint64_t moved,
-                             uint64_t total)
+int iscsihost::noteReception(const std::string &task_uuid, const std::string &version, const std::string &sink_iqn,
+                             uint64_t offset, uint64_t moved, uint64_t total)
 {
     Destination destination;
     if (int err = destination.load(task_uuid))
         return err;
     if (int err = destination.checkArriving(version))
+        return err;
+    // What an earlier sending says late must not hold for this one.
+    if (int err = checkOpening(destination.lun.record.lid, sink_iqn))
         return err;
     // One more than there is until the end: the failed sending of nothing must not look complete.
     if (int err = writeTransferCount(destination.path, Transfer::sending, {moved, total + 1}))
@@ -158,7 +222,8 @@ int iscsihost::noteReception(const std::string &task_uuid, const std::string &ve
     return updateArrival(destination.task.record.uuid, destination.arrival);
 }
 
-int iscsihost::endReception(const std::string &task_uuid, const std::string &version)
+int iscsihost::endReception(const std::string &task_uuid, const std::string &version, const std::string &sink_iqn,
+                            uint64_t total)
 {
     Destination destination;
     if (int err = destination.load(task_uuid))
@@ -168,12 +233,11 @@ int iscsihost::endReception(const std::string &task_uuid, const std::string &ver
         return 0; // told twice
     if (int err = destination.checkArriving(version))
         return err;
-    TransferCount count;
-    if (int err = readTransferCount(destination.path, Transfer::sending, count))
+    if (int err = closeSink(destination.lun.record.uuid, sink_iqn, true))
         return err;
     if (int err = finishSynchronisation(destination.path))
         return err;
-    if (int err = writeTransferCount(destination.path, Transfer::sending, {count.total, count.total}))
+    if (int err = writeTransferCount(destination.path, Transfer::sending, {total, total}))
         return err;
     Arrival arrived;
     arrived.name = destination.arrival.name;

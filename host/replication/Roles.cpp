@@ -2,12 +2,13 @@
 
 #include "host/core/LastError.h"
 #include "host/replication/Sending.h"
-#include "host/state/Database.h"
 #include "host/state/Fields.h"
 #include "host/storage/LunActions.h"
 #include "host/storage/MapFile.h"
 #include "host/storage/SnapshotStore.h"
 #include "host/storage/Versions.h"
+#include "host/target/Change.h"
+#include "host/target/TargetStore.h"
 #include "iscsihost/sink.h"
 #include "platform/error.h"
 #include "platform/iscsi_snapshot.h"
@@ -25,7 +26,7 @@ void turn(TaskRow &task)
     task.record.is_source = !task.record.is_source;
 }
 
-/// Stores the LUN's new kind and, with it, what `also` changes.
+/// Stores the LUN's new kind and, with it, what `also` changes; who may write to it in its targets follows.
 template <class Change>
 int changeKind(const LunRow &lun, int type, Change also)
 {
@@ -33,14 +34,16 @@ int changeKind(const LunRow &lun, int type, Change also)
     LunRow current;
     if (int err = lockLun(lun.record.lid, NORV_LUN_PROCESSING, lock, current))
         return err;
-    Transaction transaction;
-    if (transaction.error())
-        return transaction.error();
-    if (int err = updateLunType(current.record.lid, type))
-        return err;
-    if (int err = also())
-        return err;
-    return transaction.commit();
+    return changeRunning([&](std::vector<int> &tids) {
+        std::vector<Mapping> mappings;
+        if (int err = loadMappingsOfLun(current.record.lid, mappings))
+            return err;
+        for (const Mapping &mapping : mappings)
+            tids.push_back(mapping.tid);
+        if (int err = updateLunType(current.record.lid, type))
+            return err;
+        return also();
+    });
 }
 
 /// Leaves a sink's LUN with a whole state.

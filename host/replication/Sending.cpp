@@ -63,33 +63,31 @@ struct Route {
     bool encrypted = false; ///< the port is one that TLS is spoken on
 };
 
-/// The peer's sink, open until the object ends.
+/// The sink that the peer has opened. Unless the sending was completed, it is given up when the object ends.
 class OpenSink {
 public:
     OpenSink() = default;
     OpenSink(const OpenSink &) = delete;
-    ~OpenSink() { close(false); }
+    ~OpenSink() { giveUp(); }
 
-    /// The log-in is made with the key that the caller has, not with the one that is stored with the node.
-    int open(const TaskRow &task, const std::string &rod_key, const Route &route)
+    int enter(const PairedNode &peer, const TaskRow &task, const Json::Value &opened, const std::string &rod_key,
+              const Route &route)
     {
-        const std::string lun_uuid = task.record.dst_lun_uuid;
-        if (int err = openPeerSink(task.remoteNode(), lun_uuid, "", sink))
+        if (int err = enterPeerSink(peer, rod_key, task.record.dst_lun_uuid, opened, sink))
             return err;
         is_open = true;
-        const SinkLogIn log_in = sinkLogIn(rod_key, lun_uuid);
-        sink.unit.secret = log_in.secret;
-        sink.unit.mutual_secret = log_in.mutual_secret;
         return follow(route, rod_key);
     }
 
-    int close(bool complete, bool *volume_full = nullptr)
+    int giveUp(bool *volume_full = nullptr)
     {
         if (!is_open)
             return 0;
         is_open = false;
-        return closePeerSink(sink.node, sink.lun, sink.sink.iqn, complete, volume_full);
+        return closePeerSink(sink.node, sink.lun, sink.sink.iqn, false, volume_full);
     }
+
+    void completed() { is_open = false; }
 
     const IscsiUnit &unit() const { return sink.unit; }
     /// After a failure to send there.
@@ -154,8 +152,9 @@ public:
 private:
     int send();
     int findCause(OpenSink &sink, int err);
-    int describe(const Json::Value &reception);
+    int adapt(const Json::Value &reception);
     int sendAll(const OpenSink &sink);
+    int complete(OpenSink &sink);
     int note(uint64_t place);
     int tell(uint64_t moved);
     int checkStop() const;
@@ -170,7 +169,8 @@ private:
     PairedNode peer;
     std::vector<DataRange> ranges;
     uint64_t total = 0, moved_before = 0;
-    uint64_t offset = 0; ///< what lies below it is flushed on the peer, which knows
+    uint64_t offset = 0;   ///< what lies below it is flushed on the peer, which knows
+    std::string sink_name; ///< of the peer's opening
     bool to_zeros = false;
     bool was_full = false; ///< the peer's volume, when it was tried last
     Clock::time_point told{}, noted{};
@@ -253,52 +253,51 @@ int Sender::findCause(OpenSink &sink, int err)
     if (isFinal(told))
         return told;
     bool full = false;
-    if (err == -EIO && sink.close(false, &full) == 0 && full)
+    if (err == -EIO && sink.giveUp(&full) == 0 && full)
         return fail(NORV_ERR_OUT_OF_SPACE, "the peer's volume is full");
     return fail(err, "%s", reason.c_str());
 }
 
 int Sender::send()
 {
-    Json::Value body(Json::objectValue), reception, answer;
+    // Before the peer opens its sink, which nobody enters meanwhile: comparing contents takes its time.
+    if (int err = findDifference(base_file ? base_file.get() : -1, file.get(), snapshot.record.total_size, ranges))
+        return err;
+    Json::Value body(Json::objectValue), reception;
     body["version"] = snapshot.record.version;
     body["base"] = base_file ? base.record.version : "";
     body["name"] = snapshot.record.name;
     if (int err = askNode(peer, "POST", arrivalPath(), body, reception))
         return err;
-    if (int err = describe(reception))
-        return err;
     OpenSink sink;
-    if (int err = sink.open(task, rod_key, route))
+    if (int err = sink.enter(peer, task, reception["sink"], rod_key, route))
+        return err;
+    sink_name = sink.unit().target;
+    if (int err = adapt(reception))
         return err;
     if (int err = sendAll(sink))
         return err < 0 && err != STOPPED ? findCause(sink, err) : err;
     if (int err = checkStop())
         return err;
-    if (int err = sink.close(true))
-        return err;
-    Json::Value end(Json::objectValue);
-    end["version"] = snapshot.record.version;
-    if (int err = askNode(peer, "POST", arrivalPath() + "/end", end, answer))
+    if (int err = complete(sink))
         return err;
     task.progress.sent_size = task.progress.send_total_size = total;
     task.progress.progress_value = 100;
     return 0;
 }
 
-int Sender::describe(const Json::Value &reception)
+/// What is to be sent depends on what the peer's LUN holds.
+int Sender::adapt(const Json::Value &reception)
 {
     const Json::Value &holding = reception["holding"];
     if (!holding.isString() || !reception["offset"].isUInt64())
         return fail(NORV_ERR_BAD_RESPONSE, "the peer does not say what its LUN holds");
-    const uint64_t size = snapshot.record.total_size;
     to_zeros = holding == "zeros";
     offset = reception["offset"].asUInt64();
-    const bool from_base = holding == "base" && base_file;
-    if (int err = holding == "unknown" || (holding == "base" && !base_file)
-                      ? describeWhole(file.get(), size, ranges)
-                      : findDifference(from_base ? base_file.get() : -1, file.get(), size, ranges))
-        return err;
+    if (holding != (base_file ? "base" : "zeros")) {
+        if (int err = describeWhole(file.get(), snapshot.record.total_size, ranges))
+            return err;
+    }
     total = std::max(dataBytes(ranges), UNIT);
     moved_before = dataBelow(ranges, offset);
     return tell(0);
@@ -330,7 +329,24 @@ int Sender::sendAll(const OpenSink &sink)
     };
     if (int err = sendRanges(sending))
         return sink.explain(err);
-    return note(snapshot.record.total_size);
+    offset = snapshot.record.total_size;
+    return 0;
+}
+
+/// All has arrived: the peer makes it its own.
+int Sender::complete(OpenSink &sink)
+{
+    Json::Value body(Json::objectValue), answer;
+    body["version"] = snapshot.record.version;
+    body["iqn"] = sink_name;
+    body["total"] = Json::UInt64(total);
+    if (int err = askNode(peer, "POST", arrivalPath() + "/end", body, answer)) {
+        const std::string reason = lastError();
+        note(offset); // the next try needs not send it again
+        return fail(err, "%s", reason.c_str());
+    }
+    sink.completed();
+    return 0;
 }
 
 /// What lies below the place is flushed on the peer.
@@ -338,6 +354,7 @@ int Sender::note(uint64_t place)
 {
     Json::Value body(Json::objectValue), answer;
     body["version"] = snapshot.record.version;
+    body["iqn"] = sink_name;
     body["offset"] = Json::UInt64(place);
     body["moved"] = Json::UInt64(dataBelow(ranges, place));
     body["total"] = Json::UInt64(total);
@@ -375,8 +392,8 @@ int Sender::tell(uint64_t moved)
 
 bool isSending(const char *task_uuid)
 {
-    NamedLock lock;
-    return lock.tryTake(lockName(task_uuid)) == 0 && !lock.held();
+    bool held = false;
+    return namedLockHeld(lockName(task_uuid), held) == 0 && held;
 }
 
 int stopSending(const TaskRow &task)

@@ -49,8 +49,7 @@ int change(Query &query, std::string_view uuid)
 int loadTask(std::string_view uuid, TaskRow &row)
 {
     Query query("SELECT " TASK_COLUMNS " FROM replication_tasks WHERE uuid = ?1");
-    const std::string key = lowerCase(uuid);
-    if (!query.bind(key).next())
+    if (!query.bind(uuid).next())
         return query.error() ? query.error() : noSuchTask(uuid);
     row = readRow(query);
     return 0;

@@ -165,6 +165,15 @@ int findData(int fd, uint64_t at, uint64_t size, uint64_t &begin, uint64_t &end)
     return 0;
 }
 
+int isBlank(int fd, uint64_t size, bool &blank)
+{
+    uint64_t begin = 0, end = 0;
+    if (int err = findData(fd, 0, size, begin, end))
+        return err;
+    blank = begin >= size;
+    return 0;
+}
+
 int countData(int fd, uint64_t &bytes)
 {
     uint64_t size = 0;

@@ -22,6 +22,9 @@ int copySparsely(int from, int to, const CopyProgress &progress);
 /// Where the next data begins and ends, from `at` on; both `size` behind the last.
 int findData(int fd, uint64_t at, uint64_t size, uint64_t &begin, uint64_t &end);
 
+/// Whether it is nothing but holes: never written to, or all of it given back.
+int isBlank(int fd, uint64_t size, bool &blank);
+
 /// Bytes of a file that are not in holes.
 int countData(int fd, uint64_t &bytes);
 

@@ -131,10 +131,11 @@ int NORViSCSISnapshotRestore(const _tag_iscsi_snapshot_ *snapshot, const _tag_is
     Restoration restoration;
     if (int err = restoration.open(row, snapshot->uuid))
         return err;
+    const std::string interrupted = row.restoring_uuid; // an earlier one, which could not be completed yet
     if (int err = markRestore(row.record.lid, restoration.snapshot.record.uuid))
         return err;
     const int err = run(restoration, row, lock);
     if (err == NORV_ERR_LUN_MAPPED) // refused before anything changed
-        markRestore(row.record.lid, "");
+        markRestore(row.record.lid, interrupted);
     return err;
 }

@@ -12,6 +12,7 @@
 #include "host/storage/SnapshotFiles.h"
 #include "host/storage/Sweep.h"
 #include "host/storage/Transfers.h"
+#include "host/storage/Versions.h"
 #include "host/target/Exports.h"
 #include "iscsihost/host.h"
 #include "platform/error.h"
@@ -111,6 +112,21 @@ int take(const LunRow &lun, SnapshotRow &snapshot, LunLock &lock)
     return err;
 }
 
+/// A sink that holds another state in part has but this to go back to.
+int refuseLastWholeState(const LockedSnapshot &locked)
+{
+    if (locked.lun.record.type != NORV_LUN_TYPE_SINK)
+        return 0;
+    Versions versions;
+    if (int err = readVersions(dataPath(locked.lun.record), versions))
+        return err == NORV_ERR_FILE_NOT_FOUND ? 0 : err;
+    if (versions.current == versions.base || versions.base != locked.row.record.version)
+        return 0;
+    return fail(NORV_ERR_SNAPSHOT_LOCKED,
+                "it is the last whole state of the LUN '%s', which has received the next one in part",
+                locked.lun.record.name);
+}
+
 /// Renames the snapshot or moves it into or out of the trash.
 int move(LockedSnapshot &locked, const SnapshotRow &wanted)
 {
@@ -202,6 +218,8 @@ int NORViSCSISnapshotDelete(const _tag_iscsi_snapshot_ *snapshot, const char *wh
     if (int err = locked.take(snapshot, NORV_LUN_SNAPSHOT_DELETING))
         return err;
     const _tag_iscsi_snapshot_ &record = locked.row.record;
+    if (int err = refuseLastWholeState(locked))
+        return err;
     if (int err = checkRemovable(snapshotFolder(record)))
         return err;
     if (int err = removeSnapshot(record.uuid))

@@ -225,14 +225,12 @@ int copyVersions(int from, int to, bool quiet)
     }
     StoredVersions stored;
     snprintf(stored.base, sizeof stored.base, "%s", versions.base.c_str());
-    if (isSynchronised(versions)) {
-        if (quiet)
-            return storeSynchronised(to, what, stored);
-        if (int err = lookAt(to, what, status))
-            return err;
-        versions.current = localVersion(status);
-    }
-    snprintf(stored.current, sizeof stored.current, "%s", versions.current.c_str());
+    if (isSynchronised(versions) && quiet)
+        return storeSynchronised(to, what, stored);
+    if (int err = lookAt(to, what, status))
+        return err;
+    // Also of a state that is arriving: nothing arrives here.
+    snprintf(stored.current, sizeof stored.current, "%s", localVersion(status).c_str());
     return writeStored(to, what, stored);
 }
 

@@ -43,7 +43,7 @@ int forgetBase(const std::string &path);
 int finishSynchronisation(const std::string &path);
 
 /// Gives `to`, which holds a copy of `from`'s data, the versions of `from`. Without `quiet` somebody may be writing to
-/// `to`: its current version differs from the base then. The caller flushes `to`.
+/// `to`: its current version differs from the base then, as it does when `from`'s does. The caller flushes `to`.
 int copyVersions(int from, int to, bool quiet);
 
 /// Whether the file holds exactly the state that a synchronisation brought.

@@ -112,6 +112,13 @@ int removeOpening(int lid, const std::string &iqn)
     return changedRows() > 0 ? 0 : fail(NORV_ERR_NO_SUCH_TARGET, "the sink was closed or opened anew meanwhile");
 }
 
+int isDestination(std::string_view lun_uuid, bool &is)
+{
+    Query query("SELECT 1 FROM replication_tasks WHERE dst_lun = ?1 AND NOT is_source");
+    is = query.bind(lun_uuid).next();
+    return query.error();
+}
+
 /// A replication's destination stays a sink.
 int makeOrdinary(int lid)
 {
@@ -133,19 +140,6 @@ int flushData(const _tag_iscsi_lun_ &lun)
     if (int err = openData(lun, file))
         return err;
     return fsync(file.get()) == 0 ? 0 : failErrno(NORV_ERR_WRITE_FILE, errno, "cannot flush the LUN's file");
-}
-
-/// Whether nothing was ever written to the LUN, or all of it was given back.
-int isBlank(const _tag_iscsi_lun_ &lun, bool &blank)
-{
-    FileDescriptor file;
-    if (int err = openData(lun, file))
-        return err;
-    uint64_t begin, end;
-    if (int err = findData(file.get(), 0, lun.size, begin, end))
-        return err;
-    blank = begin >= lun.size;
-    return 0;
 }
 
 bool isVolumeFull(const _tag_iscsi_lun_ &lun)
@@ -315,25 +309,17 @@ int closeAbandonedSinks()
     return 0;
 }
 
-} // namespace norvhost
-
-namespace iscsihost {
-
-using namespace norvhost;
-
-int openSink(const std::string &lun_uuid, Sink &sink)
+int openSinkFor(const LunRow &lun, iscsihost::Sink &sink)
 {
-    LunRow row;
-    if (int err = loadLunByUuid(lun_uuid, row))
-        return err;
     LunLock lock;
-    if (int err = lockLun(row.record.lid, NORV_LUN_PROCESSING, lock, row))
+    LunRow row;
+    if (int err = lockLun(lun.record.lid, NORV_LUN_PROCESSING, lock, row))
         return err;
     if (int err = requireWhole(row, lock))
         return err;
     if (int err = checkSink(row))
         return err;
-    Sink opened;
+    iscsihost::Sink opened;
     if (int err = sinkPortal(opened.portal))
         return err;
     opened.iqn = "iqn.2001-01.norv:sink-" + newUuid();
@@ -348,10 +334,41 @@ int openSink(const std::string &lun_uuid, Sink &sink)
     if (err)
         return err;
     // Asked now that nobody else writes any more.
-    if (int failed = isBlank(row.record, opened.blank))
+    FileDescriptor file;
+    if (int failed = openData(row.record, file))
+        return failed;
+    if (int failed = isBlank(file.get(), row.record.size, opened.blank))
         return failed;
     sink = opened;
     return 0;
+}
+
+int checkOpening(int lid, const std::string &iqn)
+{
+    std::string opening;
+    if (int err = loadIqn(lid, opening))
+        return err;
+    return iqn == opening ? 0 : fail(NORV_ERR_NO_SUCH_TARGET, "the sink was opened anew meanwhile");
+}
+
+} // namespace norvhost
+
+namespace iscsihost {
+
+using namespace norvhost;
+
+int openSink(const std::string &lun_uuid, Sink &sink)
+{
+    LunRow row;
+    bool is_destination = false;
+    if (int err = loadLunByUuid(lun_uuid, row))
+        return err;
+    if (int err = isDestination(row.record.uuid, is_destination))
+        return err;
+    if (is_destination)
+        return fail(NORV_ERR_LUN_LOCKED, "the LUN '%s' is a replication's destination: nothing else writes to it",
+                    row.record.name);
+    return openSinkFor(row, sink);
 }
 
 int closeSink(const std::string &lun_uuid, const std::string &iqn, bool complete, bool *volume_full)
@@ -361,8 +378,10 @@ int closeSink(const std::string &lun_uuid, const std::string &iqn, bool complete
         return err;
     const int lid = row.record.lid;
     std::string opening;
-    if (int err = loadIqn(lid, opening))
-        return err;
+    if (int err = loadIqn(lid, opening)) {
+        const bool was_completed = complete && err == NORV_ERR_NO_SUCH_TARGET && row.record.type == NORV_LUN_TYPE_ADV;
+        return was_completed ? 0 : err; // whoever did not hear it asks again
+    }
     if (!iqn.empty() && iqn != opening)
         return fail(NORV_ERR_NO_SUCH_TARGET, "the sink was opened anew meanwhile");
     if (complete)

@@ -5,6 +5,7 @@
 /// knows, and never travels.
 #pragma once
 
+#include "host/storage/LunStore.h"
 #include "host/target/TargetStore.h"
 #include "iscsihost/sink.h"
 
@@ -41,6 +42,12 @@ int loadSinkTargets(std::vector<_tag_iscsi_target_> &targets);
 int loadSinkMasking(int tid, Masking &masking);
 /// The LUN in it.
 int loadSinkLun(int tid, MappedLun &lun);
+
+/// As iscsihost::openSink(), for whoever knows what the LUN is for.
+int openSinkFor(const LunRow &lun, iscsihost::Sink &sink);
+
+/// NORV_ERR_NO_SUCH_TARGET unless this opening of the LUN is the one that lasts.
+int checkOpening(int lid, const std::string &iqn);
 
 /// Closes all of them when their daemon is down: it took their sessions along, and a sender opens a sink anew.
 int forgetOpenSinks();

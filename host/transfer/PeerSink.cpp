@@ -46,18 +46,36 @@ std::string bracketed(const std::string &host)
     return bare_ipv6 ? "[" + host + "]" : host;
 }
 
-int openLocally(const std::string &lun_uuid, Sink &sink, std::string &host, std::string &rod_key)
+/// How an open sink is entered, when its appliance is reached at `host` and has this ROD key.
+IscsiUnit unitOf(const Sink &sink, const std::string &host, const std::string &rod_key, const std::string &lun_uuid)
 {
-    char key[256] = {};
-    if (int err = NORVExtentPoolRODKeyGet(key, sizeof key))
-        return err;
-    rod_key = key;
-    host = "127.0.0.1";
-    return iscsihost::openSink(lun_uuid, sink);
+    IscsiUnit unit;
+    unit.portal = sink.portal;
+    if (unit.portal.empty() || unit.portal[0] == ':') // it listens everywhere: where we reached it
+        unit.portal = bracketed(host) + unit.portal;
+    unit.target = sink.iqn;
+    unit.lun = sink.lun;
+    const SinkLogIn log_in = sinkLogIn(rod_key, lun_uuid);
+    unit.initiator = log_in.initiator;
+    unit.user = log_in.user;
+    unit.secret = log_in.secret;
+    unit.mutual_user = log_in.mutual_user;
+    unit.mutual_secret = log_in.mutual_secret;
+    return unit;
 }
 
-int openRemotely(const std::string &node_uuid, const std::string &lun_uuid, Sink &sink, std::string &host,
-                 std::string &rod_key)
+int openLocally(const std::string &lun_uuid, PeerSink &sink)
+{
+    char rod_key[256] = {};
+    if (int err = NORVExtentPoolRODKeyGet(rod_key, sizeof rod_key))
+        return err;
+    if (int err = iscsihost::openSink(lun_uuid, sink.sink))
+        return err;
+    sink.unit = unitOf(sink.sink, "127.0.0.1", rod_key, lun_uuid);
+    return 0;
+}
+
+int openRemotely(const std::string &node_uuid, const std::string &lun_uuid, PeerSink &sink)
 {
     PairedNode node;
     Json::Value answer;
@@ -65,11 +83,7 @@ int openRemotely(const std::string &node_uuid, const std::string &lun_uuid, Sink
         return err;
     if (int err = ask(node, lun_uuid, "open", Json::Value(Json::objectValue), answer))
         return err;
-    if (!readSink(answer, sink))
-        return fail(NORV_ERR_BAD_RESPONSE, "%s does not say where its sink is", node.host.c_str());
-    host = node.host;
-    rod_key = node.rod_key;
-    return 0;
+    return enterPeerSink(node, node.rod_key, lun_uuid, answer, sink);
 }
 
 } // namespace
@@ -77,28 +91,24 @@ int openRemotely(const std::string &node_uuid, const std::string &lun_uuid, Sink
 int openPeerSink(const std::string &node_uuid, const std::string &lun_uuid, const std::string &portal, PeerSink &sink)
 {
     PeerSink opened;
+    const bool local = NorvDRNode::DRNode::isLocalNodeId(node_uuid);
+    if (int err = local ? openLocally(lun_uuid, opened) : openRemotely(node_uuid, lun_uuid, opened))
+        return err;
     opened.node = node_uuid;
     opened.lun = lun_uuid;
-    std::string host, rod_key;
-    const bool local = NorvDRNode::DRNode::isLocalNodeId(node_uuid);
-    if (int err = local ? openLocally(lun_uuid, opened.sink, host, rod_key)
-                        : openRemotely(node_uuid, lun_uuid, opened.sink, host, rod_key))
-        return err;
-    IscsiUnit &unit = opened.unit;
-    unit.portal = opened.sink.portal;
-    if (unit.portal.empty() || unit.portal[0] == ':') // it listens everywhere: where we reached it
-        unit.portal = bracketed(host) + unit.portal;
     if (!portal.empty())
-        unit.portal = bracketed(portal);
-    unit.target = opened.sink.iqn;
-    unit.lun = opened.sink.lun;
-    const SinkLogIn log_in = sinkLogIn(rod_key, lun_uuid);
-    unit.initiator = log_in.initiator;
-    unit.user = log_in.user;
-    unit.secret = log_in.secret;
-    unit.mutual_user = log_in.mutual_user;
-    unit.mutual_secret = log_in.mutual_secret;
+        opened.unit.portal = bracketed(portal);
     sink = opened;
+    return 0;
+}
+
+int enterPeerSink(const PairedNode &node, const std::string &rod_key, const std::string &lun_uuid,
+                  const Json::Value &answer, PeerSink &sink)
+{
+    Sink opened;
+    if (!readSink(answer, opened))
+        return fail(NORV_ERR_BAD_RESPONSE, "%s does not say where its sink is", node.host.c_str());
+    sink = {node.uuid, lun_uuid, opened, unitOf(opened, node.host, rod_key, lun_uuid)};
     return 0;
 }
 

@@ -38,7 +38,7 @@ constexpr uint64_t last_step = 4096;
 constexpr auto stop_limit = 5s;
 
 /// How long the peer's web server is tried when everything was sent; shorter than a sink stays open without a session.
-constexpr auto complete_limit = 40s;
+constexpr auto complete_limit = 150s; // more than two requests that nobody answers
 
 std::string lockName(const std::string &uuid)
 {

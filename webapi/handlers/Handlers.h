@@ -3,6 +3,10 @@
 
 #include "webapi/handlers/Route.h"
 
+namespace iscsihost {
+struct Sink;
+}
+
 namespace ISCSI {
 class ISCSINodeInfo;
 class ISCSISnapshotInfo;
@@ -114,6 +118,9 @@ Result showRemoteClone(const Request &request);
 // What a peer that streams a LUN asks for.
 Result openSink(const Request &request);
 Result closeSink(const Request &request);
+
+/// The sink's JSON form, which a peer enters it by; its log-in is not in it: both sides derive that.
+Json::Value sinkForm(const iscsihost::Sink &sink);
 
 /// Resolves a LUN selector to a UUID (which may name no LUN), or a target selector to a target ID
 /// (which may name no target).

@@ -208,6 +208,7 @@ Result beginReception(const Request &request)
                                   : reception.holding == iscsihost::Holding::base ? "base"
                                                                                   : "unknown";
         result.value["offset"] = Json::UInt64(reception.offset);
+        result.value["sink"] = sinkForm(reception.sink);
         return result;
     });
 }
@@ -217,8 +218,8 @@ Result noteReception(const Request &request)
     return withTask(request, [&](ISCSILIBReplication &replication) {
         const Json::Value &in = request.input;
         const int err =
-            iscsihost::noteReception(replication.task.uuid, in["version"].asString(), in["offset"].asUInt64(),
-                                     in["moved"].asUInt64(), in["total"].asUInt64());
+            iscsihost::noteReception(replication.task.uuid, in["version"].asString(), in["iqn"].asString(),
+                                     in["offset"].asUInt64(), in["moved"].asUInt64(), in["total"].asUInt64());
         return err ? failed(err) : Result();
     });
 }
@@ -226,7 +227,9 @@ Result noteReception(const Request &request)
 Result endReception(const Request &request)
 {
     return withTask(request, [&](ISCSILIBReplication &replication) {
-        const int err = iscsihost::endReception(replication.task.uuid, request.input["version"].asString());
+        const Json::Value &in = request.input;
+        const int err = iscsihost::endReception(replication.task.uuid, in["version"].asString(), in["iqn"].asString(),
+                                                in["total"].asUInt64());
         return err ? failed(err) : Result();
     });
 }

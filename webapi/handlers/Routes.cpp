@@ -273,12 +273,15 @@ constexpr Field ARRIVAL_BEGIN[] = {
 };
 constexpr Field ARRIVAL[] = {
     {"version", Type::Text, REQUIRED, UUID_BYTES, UUID_BYTES, ERR_BAD_SENDING_SNAPSHOT_UUID},
+    {"iqn", Type::Text, REQUIRED, 1, IQN_MAX_BYTES, ERR_BAD_TARGET_IQN},
     {"offset", Type::Unsigned, REQUIRED, 0, INT64_MAX, ERR_BAD_PARAMETER},
     {"moved", Type::Unsigned, REQUIRED, 0, INT64_MAX, ERR_BAD_PARAMETER},
     {"total", Type::Unsigned, REQUIRED, 0, INT64_MAX, ERR_BAD_PARAMETER},
 };
 constexpr Field ARRIVAL_END[] = {
     {"version", Type::Text, REQUIRED, UUID_BYTES, UUID_BYTES, ERR_BAD_SENDING_SNAPSHOT_UUID},
+    {"iqn", Type::Text, REQUIRED, 1, IQN_MAX_BYTES, ERR_BAD_TARGET_IQN},
+    {"total", Type::Unsigned, REQUIRED, 0, INT64_MAX, ERR_BAD_PARAMETER},
 };
 
 constexpr Field REPLICATION_DELETE[] = {

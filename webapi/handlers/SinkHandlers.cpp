@@ -5,7 +5,18 @@
 
 namespace webapi {
 
-/// The log-in is in no answer: both sides derive it.
+Json::Value sinkForm(const iscsihost::Sink &sink)
+{
+    Json::Value form(Json::objectValue);
+    form["portal"] = sink.portal;
+    form["iqn"] = sink.iqn;
+    form["lun"] = sink.lun;
+    form["tls_port"] = sink.tls_port;
+    form["size"] = Json::UInt64(sink.size);
+    form["is_blank"] = sink.blank;
+    return form;
+}
+
 Result openSink(const Request &request)
 {
     std::string lun_uuid;
@@ -15,12 +26,7 @@ Result openSink(const Request &request)
     if (int err = iscsihost::openSink(lun_uuid, sink))
         return failed(err);
     Result result;
-    result.value["portal"] = sink.portal;
-    result.value["iqn"] = sink.iqn;
-    result.value["lun"] = sink.lun;
-    result.value["tls_port"] = sink.tls_port;
-    result.value["size"] = static_cast<Json::UInt64>(sink.size);
-    result.value["is_blank"] = sink.blank;
+    result.value = sinkForm(sink);
     return result;
 }
 

@@ -3,6 +3,7 @@
 
 #include <cstdint>
 #include <iscsihost/host.h>
+#include <iscsihost/sink.h>
 #include <string>
 
 namespace iscsihost {
@@ -24,23 +25,28 @@ enum class Holding {
 struct Reception {
     Holding holding = Holding::unknown;
     uint64_t offset = 0; ///< what lies below it has arrived before
+    Sink sink;           ///< where the rest goes, open
 };
 
 /// Makes the destination LUN ready: it holds the base, set back to the snapshot of it where needed, or the reception
-/// says what else. From now on its current version is `incoming.version` and differs from its base.
-/// NORV_ERR_NOT_A_DESTINATION_TASK, NORV_ERR_LUN_LOCKED.
+/// says what else, and opens it as a sink. From now on its current version is `incoming.version` and differs from its
+/// base. The state that arrived before stays as a snapshot.
+/// NORV_ERR_NOT_A_DESTINATION_TASK, and the codes of openSink() and of taking a snapshot.
 ISCSI_HOST_API int beginReception(const std::string &task_uuid, const Incoming &incoming, Reception &reception);
 
-/// Shuts out a sender that was killed, so that its LUN is not locked by it any more.
+/// Shuts out a sender that was killed, so that its LUN is not locked by it any more. NORV_ERR_LUN_TYPE when a
+/// destination's LUN is no sink: it receives nothing any more.
 ISCSI_HOST_API int breakReception(const std::string &task_uuid);
 
-/// What lies below `offset` has arrived and is flushed; `moved` bytes of `total`. NORV_ERR_BASE_SNAPSHOT when another
-/// state is arriving.
-ISCSI_HOST_API int noteReception(const std::string &task_uuid, const std::string &version, uint64_t offset,
-                                 uint64_t moved, uint64_t total);
+/// What lies below `offset` has arrived in the sink of this name and is flushed; `moved` bytes of `total`.
+/// NORV_ERR_BASE_SNAPSHOT when another state is arriving, NORV_ERR_NO_SUCH_TARGET when that sink is closed.
+ISCSI_HOST_API int noteReception(const std::string &task_uuid, const std::string &version, const std::string &sink_iqn,
+                                 uint64_t offset, uint64_t moved, uint64_t total);
 
-/// All has arrived and is flushed: the version is the LUN's base now. Codes as above.
-ISCSI_HOST_API int endReception(const std::string &task_uuid, const std::string &version);
+/// All of it has arrived, `total` bytes: it is flushed, the sink of this name is closed, and the version is the LUN's
+/// base. Nothing is done when that was told before. Codes as above, and those of closeSink().
+ISCSI_HOST_API int endReception(const std::string &task_uuid, const std::string &version, const std::string &sink_iqn,
+                                uint64_t total);
 
 /// The snapshot of that time which a destination LUN has of the state that it holds: whoever did not hear that it was
 /// taken asks again. Empty when there is none.

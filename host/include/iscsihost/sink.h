@@ -26,7 +26,8 @@ ISCSI_HOST_API int openSink(const std::string &lun_uuid, Sink &sink);
 
 /// Ends the opening that bears this name, or whichever there is when the name is empty; its sessions end. With
 /// `complete`, what was written is flushed first, and the LUN becomes an ordinary extent-pool LUN, writable for its
-/// initiators, unless a replication task has it as its destination. NORV_ERR_NO_SUCH_TARGET when it is not open (any
+/// initiators, unless a replication task has it as its destination; asked again, that is no failure.
+/// NORV_ERR_NO_SUCH_TARGET when it is not open (any
 /// more); after another failure it may be open still. `volume_full`, unless it is null, tells whether the LUN's volume
 /// has no room left: iSCSI does not tell its peer why a write failed.
 ISCSI_HOST_API int closeSink(const std::string &lun_uuid, const std::string &iqn, bool complete,
