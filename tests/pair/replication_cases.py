@@ -50,6 +50,13 @@ class ReplicationTest(PairTest):
     def sending(self, appliance=None):
         return (appliance or self.one).json("replication", "status", self.task)
 
+    def fail_over(self, old, new):
+        """The LUN is written on the other appliance from now on."""
+        old.iscsictl("lun", "unmap", self.lun, "data")
+        new.iscsictl("replication", "promote", self.task)
+        old.iscsictl("replication", "demote", self.task)
+        new.iscsictl("lun", "map", self.lun, "data")
+
     def wait_idle(self, appliance=None, seconds=90):
         wait_until(lambda: not self.sending(appliance)["is_locked"], "the sending ends", seconds)
 
@@ -62,14 +69,19 @@ class ReplicationTest(PairTest):
         finally:
             appliance.iscsictl("lun", "unmap", self.lun, "data")
 
+    def there(self, snapshot):
+        """The destination's snapshot of the state that this snapshot of the source has."""
+        version = self.one.json("snapshot", "show", snapshot)["version"]
+        found, = (one for one in self.two.json("snapshot", "list", self.lun) if one["version"] == version)
+        return found
+
     def expect_replica(self, snapshot):
         """The destination has this snapshot of the source, once, with its data and its facts."""
         self.assertEqual(self.replica(), checksum_at(self.one, "data"))
         here = self.one.json("snapshot", "show", snapshot)
-        there = [one for one in self.two.json("snapshot", "list", self.lun) if one["version"] == here["version"]]
-        self.assertEqual(len(there), 1, there)
+        there = self.there(snapshot)
         for fact in ("name", "version", "description", "taken_by", "snapshot_time", "is_app_consistent", "is_user_locked", "total_size"):
-            self.assertEqual(there[0][fact], here[fact], fact)
+            self.assertEqual(there[fact], here[fact], fact)
 
     def begin(self, name="disturbed", after_mib=4, rate=SLOW):
         """A slow sending of a new snapshot, with data on its way; the snapshot."""

@@ -7,7 +7,7 @@ import sqlite3
 import subprocess
 import time
 
-from cases import MIB, checksum, checksum_at, image, main
+from cases import MIB, checksum, checksum_at, image, main, random_file, write
 from pair import VOLUME, is_alive, run, wait_until
 from replication_cases import SIZE_MIB, ReplicationTest
 
@@ -134,7 +134,12 @@ class Faults(ReplicationTest):
                 self.delete_snapshots(but=snapshot)
 
     def test_retried(self):
-        """A sending that fails goes on by itself, from where its data was flushed."""
+        """A sending that fails goes on by itself, from where its data was flushed; also from a base that came from the peer."""
+        self.send(self.take("first"))
+        self.fail_over(self.one, self.two)
+        self.send(self.take("over there", self.two), self.two)
+        self.fail_over(self.two, self.one)
+        write(self.one, "data", random_file("/tmp/other", SIZE_MIB))
         snapshot = self.begin(rate=SLOWER)
         wait_until(lambda: self.arrived() > 0, "some of it is flushed", 60)
         flushed = self.arrived()
@@ -231,17 +236,19 @@ class Faults(ReplicationTest):
     def test_base_deleted(self):
         self.send(first := self.take("first"))
         self.change(self.one, 1, 64, 0x11)
-        on_two = self.two.json("snapshot", "list", self.lun)[0]["uuid"]
-        self.two.iscsictl("snapshot", "delete", on_two, "--yes")
+        self.two.iscsictl("snapshot", "delete", self.there(first)["uuid"], "--yes")
         self.assertEqual(self.send(second := self.take("second")), 64 << 10, "the destination itself is the base")
         self.expect_replica(second)
+        self.assertEqual(self.there(first)["name"], "first", "it was taken again before it was overwritten")
 
         self.change_much(random.Random(1))
         third = self.begin("third", after_mib=1)
         self.refused(self.one, "snapshot", "delete", second, "--yes", says="locked")
-        self.two.iscsictl("snapshot", "delete", self.two.json("snapshot", "list", self.lun)[0]["uuid"], "--yes")
         self.killed(self.senders())
         self.give_up()
+        first_there, second_there = (self.there(snapshot)["uuid"] for snapshot in (first, second))
+        self.refused(self.two, "snapshot", "delete", second_there, "--yes", says="last whole state")
+        self.two.iscsictl("snapshot", "delete", first_there, "--yes")
         for snapshot in (first, second, third):
             self.one.iscsictl("snapshot", "delete", snapshot, "--yes")
         self.expect_whole(self.take("nothing in common"))
@@ -323,23 +330,15 @@ class Faults(ReplicationTest):
             with self.subTest(hours=hours):
                 self.change(self.one, 1, 64, 0x10 + hours)
                 self.send(self.take(f"common {hours}"))
-                # Fail over, to a clock that is off.
-                self.one.iscsictl("lun", "unmap", self.lun, "data")
-                self.two.iscsictl("replication", "promote", self.task)
-                self.one.iscsictl("replication", "demote", self.task)
-                self.two.iscsictl("lun", "map", self.lun, "data")
+                self.fail_over(self.one, self.two)
                 self.change(self.two, 2, 64, 0x20 + hours)
                 there = self.take(f"over there {hours}", self.two)
                 self.store(self.two).execute("UPDATE snapshots SET snap_time = snap_time + ?1, create_time = create_time + ?1 WHERE uuid = ?2",
                                              (hours * 3600, there))
                 self.assertEqual(self.send(there, self.two), 64 << 10)
                 self.assertEqual(self.replica(self.one), checksum_at(self.two, "data"))
-                # And back.
                 self.change(self.two, 3, 64, 0x30 + hours)
-                self.two.iscsictl("lun", "unmap", self.lun, "data")
-                self.two.iscsictl("replication", "demote", self.task)
-                self.one.iscsictl("replication", "promote", self.task)
-                self.one.iscsictl("lun", "map", self.lun, "data")
+                self.fail_over(self.two, self.one)
                 self.change(self.one, 4, 64, 0x40 + hours)
                 # The common snapshot that looks newest may be an older one: more is sent, nothing is lost.
                 self.assertLessEqual(self.send(back := self.take(f"back {hours}")), 128 << 10)
