@@ -3,6 +3,7 @@
 #include "host/core/LastError.h"
 #include "host/core/LibIscsi.h"
 #include "host/core/PipeSignalBlock.h"
+#include "host/transfer/FileReader.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -26,13 +27,13 @@ constexpr uint32_t block_size = 512;
 
 /// Larger requests are slower: they leave the processor's cache between the steps.
 constexpr size_t request_size = 256 << 10;
-constexpr size_t requests_max = 64;
+constexpr size_t commands_max = 64, reads_max = 32, requests_max = commands_max + reads_max;
+
+/// Are left for a flush and for what unmaps.
+constexpr size_t requests_spare = 2;
 
 /// tgtd frees nothing for 4 GiB in one descriptor.
 constexpr uint64_t unmap_max = 1 << 30;
-
-/// What the disk is asked for before it is needed.
-constexpr uint64_t readahead = 16 << 20;
 
 constexpr auto login_limit = 15s, stall_limit = 60s, flush_limit = 600s, logout_limit = 2s;
 constexpr auto progress_interval = 100ms;
@@ -45,7 +46,7 @@ constexpr auto flush_interval = 5s;
 
 /// Commands that are begun before the connection is served again.
 constexpr int issues_at_once = 8;
-constexpr size_t planned_max = 8192;
+constexpr size_t planned_max = 64;
 
 struct Destroy {
     void operator()(iscsi_context *iscsi) const { iscsi_destroy_context(iscsi); }
@@ -79,6 +80,18 @@ private:
 /// A range, and the bytes of data in it: those that turn out to be zeros are data to whoever counts.
 struct Piece : DataRange {
     uint64_t data = 0;
+    struct Request *request = nullptr; ///< which reads it
+};
+
+class Sender;
+
+/// A buffer's way: a part is read, then written by a command. A flush and zeros are commands alone.
+struct Request {
+    Sender *sender = nullptr;
+    FileReader::Part part;
+    Piece piece; ///< of the command
+    bool flushes = false;
+    bool under_way = false; ///< the command
 };
 
 bool isZero(const unsigned char *data, size_t size)
@@ -99,7 +112,7 @@ int meaning(int status, const scsi_task *task)
 
 class Sender {
 public:
-    explicit Sender(const Sending &sending) : sending(sending) {}
+    explicit Sender(const Sending &sending) : sending(sending), reader(sending.from, reads_max) {}
     ~Sender()
     {
         ending = true;
@@ -111,29 +124,23 @@ public:
     int run();
 
 private:
-    /// A command under way.
-    struct Request {
-        Sender *sender;
-        unsigned char *buffer;
-        Piece piece;
-        bool flushes = false;
-        bool under_way = false;
-    };
-
     int logIn();
     int checkUnit();
     int stream();
     int plan();
-    int issue();
+    void beginReads();
+    int issue(bool &begun);
     int write(const Piece &piece);
-    int unmapGathered();
+    int unmapGathered(bool &begun);
     int beginFlush();
     uint64_t lowestOpenPlace() const;
     int began(Request *request, const scsi_task *task);
     int flush();
     void logOut();
 
-    Request *takeRequest(const Piece &piece);
+    Request *takeIdle();
+    void putBack(Request *request);
+    void prepare(Request *request, const Piece &piece);
     /// Serves the connection once, for at most a tenth of a second, and not at all long when `busy`. It fails when
     /// nothing moved for the limit.
     int serve(bool busy, Clock::duration limit);
@@ -149,12 +156,14 @@ private:
     const Buffers buffers;
     std::vector<Request> requests;
     std::vector<Request *> idle;
+    size_t commands = 0; ///< under way
 
     DataRange rest; ///< of the range that the source gave last
     bool source_ended = false;
-    std::deque<Piece> planned; ///< what comes next; the disk was asked for it
-    uint64_t planned_data = 0;
-    Piece gathered; ///< adjoining zeros, to be unmapped
+    std::deque<Piece> planned; ///< what comes next
+    size_t reads_begun = 0;    ///< of these; zeros need none
+    Piece gathered;            ///< adjoining zeros, to be unmapped
+    FileReader reader;
 
     uint64_t moved = 0, capacity = 0;
     uint64_t written = 0; ///< since the latest flush began
@@ -173,7 +182,7 @@ int Sender::run()
     requests.resize(requests_max);
     for (size_t i = 0; i < requests_max; ++i) {
         requests[i].sender = this;
-        requests[i].buffer = buffers.at(i);
+        requests[i].part.buffer = buffers.at(i);
         idle.push_back(&requests[i]);
     }
     for (const auto step : {&Sender::logIn, &Sender::checkUnit, &Sender::stream, &Sender::flush})
@@ -243,22 +252,22 @@ int Sender::stream()
     for (;;) {
         if (int err = plan())
             return err;
-        const bool all_issued = planned.empty() && gathered.length == 0;
-        if (all_issued && idle.size() == requests_max)
+        beginReads();
+        if (planned.empty() && gathered.length == 0 && commands == 0)
             return 0;
-        // In small portions: the connection is to be served meanwhile. Zeros may need a request of their own.
-        bool busy = false;
         const bool flush_due = written >= flush_step || (written > 0 && Clock::now() - last_flush > flush_interval);
-        if (!flushing && flush_due && idle.size() >= 2)
+        if (!flushing && flush_due && !idle.empty())
             if (int err = beginFlush())
                 return err;
-        for (int i = 0; i < issues_at_once && idle.size() >= 2 && !(planned.empty() && gathered.length == 0); ++i) {
-            if (int err = issue())
+        // In small portions: the connection is to be served meanwhile.
+        bool busy = false, begun = true;
+        for (int i = 0; i < issues_at_once && begun; ++i) {
+            if (int err = issue(begun))
                 return err;
-            busy = true;
+            busy = busy || begun;
         }
-        if (idle.size() == requests_max)
-            last_movement = Clock::now(); // nothing is under way
+        if (commands == 0)
+            last_movement = Clock::now(); // the unit has nothing to answer
         if (int err = serve(busy, stall_limit))
             return err;
     }
@@ -266,7 +275,7 @@ int Sender::stream()
 
 int Sender::plan()
 {
-    while (planned_data < readahead && planned.size() < planned_max) {
+    while (planned.size() < planned_max) {
         if (rest.length == 0) {
             if (source_ended)
                 return 0;
@@ -289,34 +298,55 @@ int Sender::plan()
         piece.data = rest.zeros ? 0 : piece.length;
         rest.offset += piece.length;
         rest.length -= piece.length;
-        planned_data += piece.data;
         planned.push_back(piece);
-        if (!piece.zeros)
-            posix_fadvise(sending.from, static_cast<off_t>(piece.offset), static_cast<off_t>(piece.length),
-                          POSIX_FADV_WILLNEED);
     }
     return 0;
 }
 
-/// Begins at most one command.
-int Sender::issue()
+void Sender::beginReads()
 {
+    for (; reads_begun < planned.size(); ++reads_begun) {
+        Piece &piece = planned[reads_begun];
+        if (piece.zeros)
+            continue;
+        if (requests_max - idle.size() - commands >= reads_max || idle.size() <= requests_spare)
+            return;
+        piece.request = takeIdle();
+        piece.request->part.offset = piece.offset;
+        piece.request->part.length = piece.length;
+        reader.begin(piece.request->part);
+    }
+}
+
+/// Goes on with the next piece, which may begin a command. Nothing has `begun` when it has to wait for something.
+int Sender::issue(bool &begun)
+{
+    begun = false;
+    if (commands >= commands_max)
+        return 0;
     if (planned.empty())
-        return unmapGathered();
+        return unmapGathered(begun);
     Piece &piece = planned.front();
-    if (!piece.zeros) {
-        unsigned char *const buffer = idle.back()->buffer;
-        const ssize_t count = pread(sending.from, buffer, piece.length, static_cast<off_t>(piece.offset));
-        if (count != static_cast<ssize_t>(piece.length))
-            return failErrno(-EIO, count < 0 ? errno : EIO, "cannot read what is to be sent");
-        piece.zeros = isZero(buffer, piece.length);
+    if (piece.request) {
+        FileReader::Part &part = piece.request->part;
+        if (FileReader::isUnderWay(part))
+            return 0;
+        if (int error = reader.take(part))
+            return failErrno(-EIO, error, "cannot read what is to be sent");
+        if (isZero(static_cast<unsigned char *>(part.buffer), part.length)) {
+            piece.zeros = true;
+            putBack(piece.request);
+            piece.request = nullptr;
+        }
+    } else if (!piece.zeros) {
+        return 0; // no buffer to read it into yet
     }
     if (piece.zeros && sending.to_zeros) {
         moved += piece.data;
     } else if (piece.zeros) {
         const bool adjoins = gathered.offset + gathered.length == piece.offset;
         if (gathered.length > 0 && (!adjoins || gathered.length + piece.length > unmap_max))
-            return unmapGathered();
+            return unmapGathered(begun);
         if (gathered.length == 0)
             gathered.offset = piece.offset;
         gathered.length += piece.length;
@@ -324,38 +354,56 @@ int Sender::issue()
     } else if (int err = write(piece)) {
         return err;
     }
-    planned_data -= piece.data;
     planned.pop_front();
+    --reads_begun;
+    begun = true;
     return 0;
 }
 
 int Sender::write(const Piece &piece)
 {
-    Request *const request = takeRequest(piece);
+    Request *const request = piece.request;
+    prepare(request, piece);
     return began(request,
-                 iscsi_write16_task(session.get(), sending.to.lun, piece.offset / block_size, request->buffer,
+                 iscsi_write16_task(session.get(), sending.to.lun, piece.offset / block_size,
+                                    static_cast<unsigned char *>(request->part.buffer),
                                     static_cast<uint32_t>(piece.length), block_size, 0, 0, 0, 0, 0, ended, request));
 }
 
-int Sender::unmapGathered()
+int Sender::unmapGathered(bool &begun)
 {
+    if (gathered.length == 0 || idle.empty())
+        return 0;
+    begun = true;
     unmap_list blocks = {};
     blocks.lba = gathered.offset / block_size;
     blocks.num = static_cast<uint32_t>(gathered.length / block_size);
-    Request *const request = takeRequest(gathered);
+    Request *const request = takeIdle();
+    prepare(request, gathered);
     gathered = Piece();
     return began(request, iscsi_unmap_task(session.get(), sending.to.lun, 0, 0, &blocks, 1, ended, request));
 }
 
-Sender::Request *Sender::takeRequest(const Piece &piece)
+Request *Sender::takeIdle()
 {
     Request *const request = idle.back();
     idle.pop_back();
+    return request;
+}
+
+void Sender::putBack(Request *request)
+{
+    idle.push_back(request);
+}
+
+/// For a command.
+void Sender::prepare(Request *request, const Piece &piece)
+{
     request->piece = piece;
     request->flushes = false;
     request->under_way = true;
+    ++commands;
     written += piece.data;
-    return request;
 }
 
 int Sender::began(Request *request, const scsi_task *task)
@@ -363,7 +411,8 @@ int Sender::began(Request *request, const scsi_task *task)
     if (task)
         return 0;
     request->under_way = false;
-    idle.push_back(request);
+    --commands;
+    putBack(request);
     return fail(-ENOMEM, "cannot begin an iSCSI command: %s", iscsi_get_error(session.get()));
 }
 
@@ -383,7 +432,8 @@ int Sender::beginFlush()
 {
     Piece place;
     place.offset = lowestOpenPlace();
-    Request *const request = takeRequest(place);
+    Request *const request = takeIdle();
+    prepare(request, place);
     request->flushes = true;
     flushing = true;
     last_flush = Clock::now();
@@ -424,9 +474,11 @@ int Sender::awaitAnswer(Clock::duration limit)
 int Sender::serve(bool busy, Clock::duration limit)
 {
     iscsi_context *const iscsi = session.get();
-    pollfd connection = {iscsi_get_fd(iscsi), static_cast<short>(iscsi_which_events(iscsi)), 0};
-    poll(&connection, 1, busy ? 0 : static_cast<int>(progress_interval / 1ms));
-    if (iscsi_service(iscsi, connection.revents) != 0)
+    pollfd events[] = {{iscsi_get_fd(iscsi), static_cast<short>(iscsi_which_events(iscsi)), 0},
+                       {reader.event(), POLLIN, 0}};
+    poll(events, 2, busy ? 0 : static_cast<int>(progress_interval / 1ms));
+    reader.collect();
+    if (iscsi_service(iscsi, events[0].revents) != 0)
         return failure ? failure
                        : fail(-ECONNRESET, "the connection to %s broke: %s", sending.to.portal.c_str(),
                               iscsi_get_error(iscsi));
@@ -467,7 +519,8 @@ void Sender::ended(iscsi_context *iscsi, int status, void *data, void *request)
     Request &mine = *static_cast<Request *>(request);
     Sender &self = *mine.sender;
     const std::unique_ptr<scsi_task, FreeTask> task(static_cast<scsi_task *>(data));
-    self.idle.push_back(&mine);
+    self.putBack(&mine);
+    --self.commands;
     mine.under_way = false;
     self.last_movement = Clock::now();
     if (mine.flushes)

@@ -33,7 +33,7 @@ struct Sending {
 };
 
 /// Sends it all and flushes the unit. One connection, which is not made again: whoever wants to go on after a failure
-/// begins anew with the ranges that are left, from where it was flushed to. Takes 16 MiB of memory, whatever the size.
+/// begins anew with the ranges that are left, from where it was flushed to. Takes 24 MiB of memory, whatever the size.
 /// The calling thread does everything; a process may fork before and after.
 ///
 /// 0, the code of `next` or `progress`, or a negative errno value with its reason recorded:
