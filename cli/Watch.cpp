@@ -28,7 +28,7 @@ namespace {
 using Clock = std::chrono::steady_clock;
 
 // Short actions are seen to end soon, long ones are not asked about all the time.
-constexpr long FIRST_LOOK_NS = 20'000'000;
+constexpr long FIRST_LOOK_NS = 5'000'000;
 constexpr long LOOK_INTERVAL_NS = 200'000'000;
 
 volatile sig_atomic_t interrupted = 0;
