@@ -2,9 +2,10 @@
 import os
 import random
 import subprocess
+import threading
 import time
 
-from clones import NOISE, add_lun, make_noise, plain_write, sent_to, write_noise
+from clones import HERE, NOISE, add_lun, make_noise, plain_write, sent_to, write_noise
 from machines import MIB, run
 from pair import VOLUME, pair
 from report import alternate, heading, row
@@ -147,6 +148,28 @@ class Btrfs:
             appliance.run("sh", "-c", f"umount {BTRFS} && rm /tmp/btrfs.img")
 
 
+def sessions(two, size):
+    """Whether more than one session would be quicker."""
+    make_noise(size)
+
+    def write_at_once(count):
+        urls = [add_lun(two, f"plain{number}", size) for number in range(count)]
+        start = time.perf_counter()
+        writers = [threading.Thread(target=write_noise, args=(url,)) for url in urls]
+        for writer in writers:
+            writer.start()
+        for writer in writers:
+            writer.join()
+        taken = (time.perf_counter() - start) / count
+        for number in range(count):
+            two.iscsictl("target", "delete", f"plain{number}", "--yes")
+            two.iscsictl("lun", "delete", f"plain{number}", "--yes")
+        return taken
+
+    both, single = alternate(lambda: write_at_once(2), lambda: write_at_once(1), rounds=3)
+    row("plain writes: two sessions, beside one", both, single, "s", both / single)
+
+
 def full(one, two, size):
     """The whole of a LUN, beside plain writes of the same, rsync and btrfs."""
     make_noise(size)
@@ -169,6 +192,18 @@ def full(one, two, size):
     one.run("rm", f"{VOLUME}/file")
 
 
+def count_unsynced(replica, base, newest):
+    """Seconds that the library takes, asked by a program on the appliance."""
+    run("cp", f"{HERE}/bench_snapshots", f"/proc/{replica.one.pid}/root/tmp/")
+    return float(replica.one.run("/tmp/bench_snapshots", "count", replica.task, base, newest).stdout)
+
+
+def ask_unsynced(replica, base, newest):
+    start = time.perf_counter()
+    replica.one.iscsictl("replication", "unsynced", replica.task, newest, "--base", base)
+    return time.perf_counter() - start
+
+
 def increments(one, two, size, rounds=3):
     """One hundredth of a LUN changed in scattered blocks."""
     replica = Replica(one, two, "changing", size)
@@ -188,12 +223,11 @@ def increments(one, two, size, rounds=3):
     row("bytes on the wire, beside bytes changed", wire / MIB, changed / MIB, "MiB", wire / changed)
 
     change_lun(replica.url, places(size, count, rounds))
-    base = replica.number
+    base = one.json("snapshot", "list", replica.name)[-1]["uuid"]
     newest = replica.take()
-    start = time.perf_counter()
-    one.iscsictl("replication", "unsynced", replica.task, newest, "--base", f"changing_s{base}")
-    counted = time.perf_counter() - start
-    row("counting what to send, beside sending it", counted, ours, "s", counted / ours)
+    counted, asked = alternate(lambda: count_unsynced(replica, base, newest), lambda: ask_unsynced(replica, base, newest), rounds=5)
+    row("counting what to send, beside sending it", counted, ours, "s", counted / ours, 0.1)
+    row("  the same through iscsictl", asked, ours, "s", asked / ours)
     replica.send(newest)
     row("memory of a sending, beside 64 MiB", replica.memory / MIB, 64, "MiB", replica.memory / (64 * MIB), 1)
     return replica, ours, count
@@ -241,6 +275,7 @@ def replications(full_size=2048 * MIB, size=4096 * MIB):
     heading("Replication, until the destination has the state as its own")
     one, two = pair("10G")
     one.join(two)
+    sessions(two, full_size // 2)
     full(one, two, full_size)
     growth(one, two, 1024 * MIB, 8192 * MIB)
     make_noise(size)

@@ -1,15 +1,18 @@
 // How long one action of the library on a snapshot takes, in seconds, on standard output.
 #include "iscsiwebapi/ISCSIErrorCode.h"
 #include "iscsiwebapi/ISCSILIBLUN.h"
+#include "iscsiwebapi/ISCSILIBReplication.h"
 
 #include <chrono>
 #include <cstdio>
 #include <cstring>
 #include <ctime>
 #include <functional>
+#include <unistd.h>
 
 using ISCSI::ISCSISnapshotInfo;
 using ISCSI::LIB::LIBLUN::ISCSILIBLUN;
+using ISCSI::LIB::LIBReplication::ISCSILIBReplication;
 
 namespace {
 
@@ -37,6 +40,19 @@ int exportTo(const std::string &selector, const std::string &folder)
     return NORViSCSISnapshotWaitUntilUnlock(&snapshot, 0);
 }
 
+/// Until it is known how much of the second snapshot a peer lacks that has the first.
+int countUnsynced(const std::string &task, const std::string &base, const std::string &snapshot)
+{
+    ISCSILIBReplication replication(task);
+    if (int err = replication.startToComputeUnsyncSize(base, snapshot))
+        return err;
+    unsigned long long size = 0;
+    for (bool completed = false; !completed; usleep(1000))
+        if (int err = replication.getCurrentUnsyncSize(size, completed))
+            return err;
+    return size > 0 ? 0 : ISCSI::ERR_DEFAULT_ERROR_CODE;
+}
+
 } // namespace
 
 int main(int argc, char **argv)
@@ -46,6 +62,8 @@ int main(int argc, char **argv)
         work = [&] { return take(argv[2]); };
     else if (argc == 4 && strcmp(argv[1], "export") == 0)
         work = [&] { return exportTo(argv[2], argv[3]); };
+    else if (argc == 5 && strcmp(argv[1], "count") == 0)
+        work = [&] { return countUnsynced(argv[2], argv[3], argv[4]); };
     else
         return 2;
     const auto start = std::chrono::steady_clock::now();
