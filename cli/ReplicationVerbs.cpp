@@ -183,13 +183,14 @@ void addUnsynced(Commands &commands, CLI::App &noun)
             action.input = a->input;
             action.title = "Comparing " + *snapshot;
             action.later = "the same command tells again";
-            action.ask = [a] {
+            Json::Value count;
+            action.ask = [a, &count] {
+                count = request(Method::Get, taskPath(a->selector, "/unsynced"));
                 Progress progress;
-                progress.running = !request(Method::Get, taskPath(a->selector, "/unsynced"))["is_completed"].asBool();
+                progress.running = !count["is_completed"].asBool();
                 return progress;
             };
             watch(action);
-            const Json::Value count = request(Method::Get, taskPath(a->selector, "/unsynced"));
             if (a->json)
                 return printJson(count);
             print(shownSize(count["unsync_size"].asUInt64()) + "\n");

@@ -60,9 +60,12 @@ public:
     {
         pollfd readable = {fd, POLLIN, 0}; // a negative one is none
         const timespec moment = {0, interval};
-        interval = std::min(2 * interval, LOOK_INTERVAL_NS);
+        interval = std::min(interval + interval / 2, LOOK_INTERVAL_NS);
         return ppoll(&readable, 1, &moment, &before_mask) > 0;
     }
+
+    /// Something new began: the next pauses are short again.
+    void beginAnew() { interval = FIRST_LOOK_NS; }
 
 private:
     long interval = FIRST_LOOK_NS;
@@ -302,6 +305,7 @@ Json::Value watch(const Action &action)
     Json::Value answer = request.answer();
     if (action.started)
         action.started(answer);
+    interrupt.beginAnew();
     for (Progress progress = action.ask();; progress = action.ask()) {
         if (progress.running || progress.total)
             meter.show(progress);
