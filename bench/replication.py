@@ -125,6 +125,7 @@ class Btrfs:
     def __init__(self, one, two, size):
         self.one, self.two, self.number = one, two, 0
         for appliance in (one, two):
+            appliance.run("fstrim", VOLUME)  # both lie in memory
             appliance.run("sh", "-c", f"mkdir -p {BTRFS} && truncate -s {size} /tmp/btrfs.img && "
                                       f"mkfs.btrfs -q /tmp/btrfs.img && mount -o loop /tmp/btrfs.img {BTRFS}")
         one.run("btrfs", "subvolume", "create", f"{BTRFS}/data")
@@ -248,7 +249,7 @@ def beside_rsync(one, two, size, ours, count):
 def beside_btrfs(one, two, size, ours, count):
     btrfs = Btrfs(one, two, size + 1024 * MIB)
     path = f"/proc/{one.pid}/root{BTRFS}/data/file"
-    run("cp", NOISE, path)
+    run("mv", NOISE, path)
     btrfs.send()
     change_file(path, places(size, count, 98))
     peer = btrfs.send()
