@@ -9,21 +9,38 @@
 
 namespace norvhost {
 
+namespace {
+
 // The kernel's own interface (io_submit(2)): a library for four calls would make every start of a program longer.
 
-FileReader::FileReader(int file, unsigned at_once) : file(file)
+/// 0 when there is none. Giving one back takes the kernel 40 ms: it stays until the process ends. A child has none of
+/// its parent's.
+aio_context_t contextOfProcess()
+{
+    static pid_t owner = 0;
+    static aio_context_t context = 0;
+    if (owner == getpid())
+        return context;
+    owner = getpid();
+    context = 0;
+    return syscall(SYS_io_setup, FileReader::most_at_once, &context) == 0 ? context : context = 0;
+}
+
+} // namespace
+
+FileReader::FileReader(int file) : file(file)
 {
     const std::string path = "/proc/self/fd/" + std::to_string(file);
     direct.reset(open(path.c_str(), O_RDONLY | O_DIRECT | O_CLOEXEC));
     ended_event.reset(eventfd(0, EFD_NONBLOCK | EFD_CLOEXEC));
-    if (!direct || !ended_event || syscall(SYS_io_setup, at_once, &context) != 0)
-        context = 0;
+    if (direct && ended_event)
+        context = contextOfProcess();
 }
 
 FileReader::~FileReader()
 {
-    if (context)
-        syscall(SYS_io_destroy, context);
+    while (under_way > 0)
+        takeEnded(true);
 }
 
 void FileReader::begin(Part &part)
@@ -40,26 +57,30 @@ void FileReader::begin(Part &part)
     iocb *requests[] = {&part.request};
     part.under_way = context && syscall(SYS_io_submit, context, 1L, requests) == 1;
     part.cached = !part.under_way;
-    if (part.cached)
+    if (part.under_way)
+        ++under_way;
+    else
         posix_fadvise(file, static_cast<off_t>(part.offset), static_cast<off_t>(part.length), POSIX_FADV_WILLNEED);
 }
 
 void FileReader::collect()
 {
-    if (!context)
-        return;
     uint64_t count = 0;
-    if (read(ended_event.get(), &count, sizeof count) != sizeof count)
-        return;
-    io_event events[32];
-    timespec at_once = {};
-    for (long i, ended = 1; ended > 0;) {
-        ended = syscall(SYS_io_getevents, context, 0L, 32L, events, &at_once);
-        for (i = 0; i < ended; ++i) {
-            Part &part = *reinterpret_cast<Part *>(static_cast<uintptr_t>(events[i].data));
-            part.result = events[i].res;
-            part.under_way = false;
-        }
+    if (under_way > 0 && ::read(ended_event.get(), &count, sizeof count) == sizeof count)
+        takeEnded(false);
+}
+
+void FileReader::takeEnded(bool wait)
+{
+    io_event events[most_at_once];
+    timespec none = {};
+    const long ended = syscall(SYS_io_getevents, context, wait ? 1L : 0L, static_cast<long>(most_at_once), events,
+                               wait ? nullptr : &none);
+    for (long i = 0; i < ended; ++i) {
+        Part &part = *reinterpret_cast<Part *>(static_cast<uintptr_t>(events[i].data));
+        part.result = events[i].res;
+        part.under_way = false;
+        --under_way;
     }
 }
 

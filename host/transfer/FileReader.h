@@ -24,8 +24,10 @@ public:
         iocb request = {};
     };
 
+    static constexpr unsigned most_at_once = 32;
+
     /// The file stays the caller's.
-    FileReader(int file, unsigned at_once);
+    explicit FileReader(int file);
     /// Waits for what is under way.
     ~FileReader();
     FileReader(const FileReader &) = delete;
@@ -43,11 +45,13 @@ public:
     int take(Part &part);
 
 private:
+    void takeEnded(bool wait);
     int readCached(const Part &part) const;
 
     const int file;
     FileDescriptor direct, ended_event;
     aio_context_t context = 0;
+    unsigned under_way = 0;
 };
 
 } // namespace norvhost

@@ -27,7 +27,7 @@ constexpr uint32_t block_size = 512;
 
 /// Larger requests are slower: they leave the processor's cache between the steps.
 constexpr size_t request_size = 256 << 10;
-constexpr size_t commands_max = 64, reads_max = 32, requests_max = commands_max + reads_max;
+constexpr size_t commands_max = 64, reads_max = FileReader::most_at_once, requests_max = commands_max + reads_max;
 
 /// Are left for a flush and for what unmaps.
 constexpr size_t requests_spare = 2;
@@ -41,7 +41,7 @@ constexpr int keepalive_seconds = 10, keepalive_count = 3;
 
 /// What is written between two flushes, which make the unit's disk work along: the last one has little to wait for. On
 /// a slow line time passes first.
-constexpr uint64_t flush_step = 64 << 20;
+constexpr uint64_t flush_step_first = 8 << 20, flush_step_max = 64 << 20;
 constexpr auto flush_interval = 5s;
 
 /// Commands that are begun before the connection is served again.
@@ -112,7 +112,7 @@ int meaning(int status, const scsi_task *task)
 
 class Sender {
 public:
-    explicit Sender(const Sending &sending) : sending(sending), reader(sending.from, reads_max) {}
+    explicit Sender(const Sending &sending) : sending(sending), reader(sending.from) {}
     ~Sender()
     {
         ending = true;
@@ -167,6 +167,7 @@ private:
 
     uint64_t moved = 0, capacity = 0;
     uint64_t written = 0; ///< since the latest flush began
+    uint64_t flush_step = flush_step_first;
     bool flushing = false;
     Clock::time_point last_movement, last_flush, last_told;
     bool answer_came = false, ending = false;
@@ -437,6 +438,7 @@ int Sender::beginFlush()
     request->flushes = true;
     flushing = true;
     last_flush = Clock::now();
+    flush_step = std::min(2 * flush_step, flush_step_max);
     written = 0;
     return began(request, iscsi_synchronizecache16_task(session.get(), sending.to.lun, 0, 0, 0, 0, ended, request));
 }
