@@ -29,6 +29,7 @@
 #include <syslog.h>
 #include <thread>
 #include <unistd.h>
+#include <utility>
 
 namespace norvhost {
 namespace {
@@ -390,6 +391,29 @@ int Sender::tell(uint64_t moved)
 
 } // namespace
 
+namespace {
+
+/// Whether this process, or the one that it was split off from, has sent for the task before.
+bool isNextTry(const std::string &task_uuid)
+{
+    static std::string begun;
+    return std::exchange(begun, task_uuid) == task_uuid;
+}
+
+/// Stopped between two tries.
+int endStopped(const char *task_uuid)
+{
+    TaskRow task;
+    if (int err = loadTask(task_uuid, task))
+        return err;
+    if (int err = requestStop(task.record.uuid, false))
+        return err;
+    task.progress.error = STOPPED;
+    return updateProgress(task.progress);
+}
+
+} // namespace
+
 bool isSending(const char *task_uuid)
 {
     bool held = false;
@@ -455,6 +479,12 @@ int NORViSCSIReplicationTaskSendSnapshot(const _tag_iscsi_task_ *task, const cha
 {
     if (!task || !snapshot_uuid || !rod_key)
         return fail(NORV_ERR_NULL_POINTER, "a task, a ROD key and a snapshot are needed");
+    bool stop = false;
+    if (isNextTry(task->uuid))
+        if (int err = stopRequested(task->uuid, stop))
+            return err;
+    if (stop)
+        return endStopped(task->uuid);
     Sender sender;
     sender.rod_key = rod_key;
     if (encrypted)
@@ -481,7 +511,14 @@ int NORViSCSIReplicationTaskStopSendingSnapshot(const _tag_iscsi_task_ *task)
 {
     if (!task)
         return fail(NORV_ERR_NULL_POINTER, "no task record");
-    if (!isSending(task->uuid))
+    TaskRow row;
+    _tag_iscsi_task_progress_ progress;
+    if (int err = loadTask(task->uuid, row))
+        return err;
+    if (int err = readProgress(row, progress))
+        return err;
+    const bool may_try_again = progress.error && progress.error != STOPPED && progress.error != FINAL;
+    if (!may_try_again && !isSending(task->uuid))
         return fail(NORV_ERR_TASK_NOT_RUNNING, "the task %s is not sending", task->uuid);
     return requestStop(task->uuid, true);
 }

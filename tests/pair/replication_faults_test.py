@@ -151,6 +151,16 @@ class Faults(ReplicationTest):
         self.assertLess(self.two.received_bytes() - received, (SIZE_MIB + 2) * MIB - flushed)
         self.expect_replica(snapshot)
 
+    def test_stopped_between_tries(self):
+        self.begin()
+        self.killed(self.senders())
+        wait_until(lambda: self.sending()["error"] not in (0, -19), "the worker knows that it failed", 10)
+        self.one.iscsictl("replication", "stop", self.task)
+        self.wait_idle(seconds=60)
+        self.assertEqual(self.sending()["error"], -19)
+        self.refused(self.one, "replication", "stop", self.task, says="not sending")
+        self.expect_whole(self.take("later"))
+
     def test_link_cut(self):
         for number, seconds in enumerate(CUTS):
             with self.subTest(seconds=seconds):
