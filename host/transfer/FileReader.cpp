@@ -1,6 +1,7 @@
 #include "host/transfer/FileReader.h"
 
 #include <cerrno>
+#include <cstring>
 #include <fcntl.h>
 #include <string>
 #include <sys/eventfd.h>
@@ -8,7 +9,6 @@
 #include <unistd.h>
 
 namespace norvhost {
-
 namespace {
 
 // The kernel's own interface (io_submit(2)): a library for four calls would make every start of a program longer.
@@ -45,8 +45,9 @@ FileReader::~FileReader()
 
 void FileReader::begin(Part &part)
 {
+    void *const self = &part;
     part.request = {};
-    part.request.aio_data = reinterpret_cast<uintptr_t>(&part);
+    memcpy(&part.request.aio_data, &self, sizeof self);
     part.request.aio_lio_opcode = IOCB_CMD_PREAD;
     part.request.aio_fildes = static_cast<uint32_t>(direct.get());
     part.request.aio_buf = reinterpret_cast<uintptr_t>(part.buffer);
@@ -77,7 +78,9 @@ void FileReader::takeEnded(bool wait)
     const long ended = syscall(SYS_io_getevents, context, wait ? 1L : 0L, static_cast<long>(most_at_once), events,
                                wait ? nullptr : &none);
     for (long i = 0; i < ended; ++i) {
-        Part &part = *reinterpret_cast<Part *>(static_cast<uintptr_t>(events[i].data));
+        void *ended_part = nullptr;
+        memcpy(&ended_part, &events[i].data, sizeof ended_part);
+        Part &part = *static_cast<Part *>(ended_part);
         part.result = events[i].res;
         part.under_way = false;
         --under_way;
