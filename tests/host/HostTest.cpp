@@ -1,11 +1,13 @@
 #include "HostTest.h"
 
 #include "host/core/Lock.h"
+#include "host/core/Process.h"
 #include "host/state/Database.h"
 #include "host/storage/DataFile.h"
 
 #include <cstdio>
 #include <cstdlib>
+#include <fcntl.h>
 #include <filesystem>
 #include <sys/stat.h>
 #include <sys/wait.h>
@@ -79,6 +81,34 @@ void HostTest::map(const _tag_iscsi_lun_ &lun)
     EXPECT_EQ(0, target.run());
     Query mapping("INSERT INTO mappings VALUES (1, ?1, 1)");
     EXPECT_EQ(0, mapping.bind(lun.lid).run());
+}
+
+std::string HostTest::run(std::vector<std::string> arguments)
+{
+    ProgramRun program;
+    program.arguments = std::move(arguments);
+    ProgramResult result;
+    EXPECT_EQ(0, runProgram(program, result)) << iscsi_host_last_error();
+    EXPECT_EQ(0, result.status) << result.errors;
+    return lastLine(result.output);
+}
+
+void HostTest::fillDisk(const std::string &folder)
+{
+    const int fd = open((folder + "/fill").c_str(), O_CREAT | O_WRONLY, 0600);
+    ASSERT_LE(0, fd);
+    for (off_t at = 0, length = off_t(MiB); length >= 4096;)
+        if (fallocate(fd, 0, at, length) == 0)
+            at += length;
+        else
+            length /= 2;
+    close(fd);
+    for (int i = 0;; ++i) {
+        const int file = open((folder + "/inode" + std::to_string(i)).c_str(), O_CREAT | O_WRONLY | O_EXCL, 0600);
+        if (file < 0)
+            break;
+        close(file);
+    }
 }
 
 std::set<std::string> HostTest::files()

@@ -7,6 +7,8 @@
 #include "platform/error.h"
 #include "platform/iscsi_lun.h"
 
+#include <cstdlib>
+#include <ctime>
 #include <functional>
 #include <gtest/gtest.h>
 #include <set>
@@ -38,12 +40,31 @@ protected:
     std::string health(const _tag_iscsi_lun_ &lun);
     void map(const _tag_iscsi_lun_ &lun);
 
+    /// Runs a program that must succeed; returns the last line of its output.
+    static std::string run(std::vector<std::string> arguments);
+    /// Leaves no block for data and none for another file; the blocks are those of the file "fill".
+    static void fillDisk(const std::string &folder);
+
     /// Every file of the volume, in its LUN folders.
     std::set<std::string> files();
     /// Those that the store's rows name.
     std::set<std::string> namedFiles();
     /// The files are those that the rows name, every LUN is healthy and nothing is locked.
     void expectConsistent();
+};
+
+/// A time zone, as long as it lives.
+struct Zone {
+    explicit Zone(const char *name)
+    {
+        setenv("TZ", name, 1);
+        tzset();
+    }
+    ~Zone()
+    {
+        unsetenv("TZ");
+        tzset();
+    }
 };
 
 /// Runs the function in a process of its own, which exits with its result.

@@ -9,24 +9,13 @@
 #include <cstdio>
 #include <poll.h>
 #include <random>
-#include <sys/wait.h>
 #include <unistd.h>
 
 namespace norvhost {
 namespace {
 
 struct KillTest : HostTest {
-    /// Another process that has the state open, as the daemons have: the last one to close it writes everything back.
-    const pid_t keeper = inChild([] {
-        openDatabase();
-        return pause();
-    });
-
-    ~KillTest() override
-    {
-        kill(keeper, SIGKILL);
-        waitpid(keeper, nullptr, 0);
-    }
+    const StateKeeper keeper;
 
     /// Kills the work at each of its system calls, from the same beginning each time.
     void killEverywhere(const std::function<void()> &prepare, const std::function<int()> &work)

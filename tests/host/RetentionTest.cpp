@@ -15,19 +15,6 @@ namespace {
 constexpr int64_t hour = 3600, day = 24 * hour;
 constexpr int64_t noon = 1767268800; // Thursday 2026-01-01 12:00 UTC
 
-struct Zone {
-    explicit Zone(const char *name)
-    {
-        setenv("TZ", name, 1);
-        tzset();
-    }
-    ~Zone()
-    {
-        unsetenv("TZ");
-        tzset();
-    }
-};
-
 /// Which ones stay, as their places in the list: "0,2".
 std::string kept(const std::vector<RetentionCandidate> &candidates, const RetentionPolicy &policy, int64_t now)
 {

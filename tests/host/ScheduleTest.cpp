@@ -15,19 +15,6 @@ namespace {
 
 constexpr const char *berlin = "CET-1CEST,M3.5.0,M10.5.0/3";
 
-struct Zone {
-    explicit Zone(const char *name)
-    {
-        setenv("TZ", name, 1);
-        tzset();
-    }
-    ~Zone()
-    {
-        unsetenv("TZ");
-        tzset();
-    }
-};
-
 int64_t parseTime(const char *text)
 {
     tm time = {};
@@ -244,14 +231,20 @@ TEST_F(ScheduleTest, JobsBelongToLuns)
     EXPECT_NE(nullptr, strstr(iscsi_host_last_error(), "never"));
     EXPECT_EQ(NORV_ERR_FILE_EXISTS, iscsihost::addSchedule("snapshot", lun.lid, "1h", none));
     EXPECT_EQ(NORV_ERR_NO_SUCH_LUN, iscsihost::addSchedule("snapshot", 9, "1h", none));
+    EXPECT_EQ(NORV_ERR_BAD_PARAMETER, iscsihost::addSchedule("other", lun.lid, "1h", none));
     EXPECT_EQ(-1, none);
     EXPECT_EQ(id, ScheduleSnapshotTaskGetIDByLid(lun.lid));
+    int64_t backup = 0;
+    ASSERT_EQ(0, iscsihost::addSchedule("backup", lun.lid, "daily", backup));
+    ASSERT_EQ(0, update(lun, "renamed", lun.size));
+    EXPECT_EQ(backup, NORViSCSILunTaskGetSchIDByName("renamed"));
+    EXPECT_EQ(-1, NORViSCSILunTaskGetSchIDByName("a"));
 
     lun.options = NORV_LUN_OPTION_TRASH;
     ASSERT_EQ(0, NORViSCSILunUnload(&lun)) << iscsi_host_last_error();
     EXPECT_EQ("", claim(time(nullptr) + 3600)) << "a LUN in the trash is left alone";
     ASSERT_EQ(0, NORViSCSILunLoad(&lun)) << iscsi_host_last_error();
-    EXPECT_EQ("a", claim(time(nullptr) + 3600));
+    EXPECT_EQ("renamed", claim(time(nullptr) + 3600));
 
     ASSERT_EQ(0, NORViSCSILunDelete(&lun)) << iscsi_host_last_error();
     EXPECT_TRUE(list().empty());

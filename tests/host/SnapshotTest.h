@@ -39,8 +39,6 @@ protected:
 
     /// As HostTest's, and the same of snapshots.
     void expectConsistent();
-
-    static void run(const std::vector<std::string> &arguments);
 };
 
 /// 4 KiB that the seed decides, in such distances.

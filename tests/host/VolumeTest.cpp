@@ -1,10 +1,8 @@
 #include "HostTest.h"
 
-#include "host/core/Process.h"
 #include "host/state/Database.h"
 #include "host/storage/Volumes.h"
 
-#include <fcntl.h>
 #include <filesystem>
 #include <fstream>
 #include <sys/stat.h>
@@ -12,18 +10,6 @@
 
 namespace norvhost {
 namespace {
-
-int run(std::vector<std::string> arguments, std::string *output = nullptr)
-{
-    ProgramRun program;
-    program.arguments = std::move(arguments);
-    ProgramResult result;
-    EXPECT_EQ(0, runProgram(program, result)) << iscsi_host_last_error();
-    if (output)
-        *output = lastLine(result.output);
-    EXPECT_EQ(0, result.status) << result.errors;
-    return result.status;
-}
 
 struct VolumeTest : HostTest {
     iscsihost::Volume only(const std::string &path)
@@ -59,26 +45,6 @@ struct VolumeTestNeedsRoot : VolumeTest {
     {
         struct stat above, here;
         return stat(root.c_str(), &above) == 0 && stat(xfs.c_str(), &here) == 0 && above.st_dev != here.st_dev;
-    }
-    /// Leaves no block for data and none for another file.
-    void fill()
-    {
-        const int fd = open((xfs + "/fill").c_str(), O_CREAT | O_WRONLY, 0600);
-        ASSERT_LE(0, fd);
-        off_t at = 0;
-        for (off_t length = off_t(MiB); length >= 4096;) {
-            if (fallocate(fd, 0, at, length) == 0)
-                at += length;
-            else
-                length /= 2;
-        }
-        close(fd);
-        for (int i = 0;; ++i) {
-            const int file = open((xfs + "/inode" + std::to_string(i)).c_str(), O_CREAT | O_WRONLY | O_EXCL, 0600);
-            if (file < 0)
-                break;
-            close(file);
-        }
     }
 };
 
@@ -163,7 +129,7 @@ TEST_F(VolumeTestNeedsRoot, AFullDiskRefusesAndKeepsNothing)
     EXPECT_EQ(NORV_ERR_OUT_OF_SPACE, NORViSCSILunCreate(&more));
     EXPECT_EQ(NORV_ERR_OUT_OF_SPACE, update(lun, "b", 1024 * MiB));
 
-    fill();
+    fillDisk(xfs);
     more = wanted("more", NORV_LUN_TYPE_FILE, 2 * MiB);
     EXPECT_EQ(NORV_ERR_OUT_OF_SPACE, NORViSCSILunCreate(&more)) << iscsi_host_last_error();
     more = wanted("thin");
@@ -186,7 +152,7 @@ TEST_F(VolumeTestNeedsRoot, AFullStateRefusesAndKeepsNothing)
     closeDatabase();
     ASSERT_EQ(0, iscsihost::addVolume(volume)) << iscsi_host_last_error();
     const _tag_iscsi_lun_ lun = create("a");
-    fill();
+    fillDisk(xfs);
 
     int made = 0, err = 0;
     for (; made < 1000 && !err; ++made) {
@@ -227,8 +193,7 @@ TEST_F(VolumeTestNeedsRoot, ABlockDeviceServesOneLun)
     const std::string image = root + "/disk";
     std::ofstream(image).close();
     ASSERT_EQ(0, truncate(image.c_str(), 16 * MiB));
-    std::string device;
-    ASSERT_EQ(0, run({"losetup", "--find", "--show", image}, &device));
+    const std::string device = run({"losetup", "--find", "--show", image});
 
     _tag_iscsi_lun_ lun = wanted("disk", NORV_LUN_TYPE_BLOCK, 0);
     snprintf(lun.location, sizeof lun.location, "%s", device.c_str());
@@ -246,8 +211,7 @@ TEST_F(VolumeTestNeedsRoot, ABlockDeviceServesOneLun)
     EXPECT_EQ(NORV_ERR_LUN_TYPE, NORViSCSILunUnload(&lun));
 
     // The device that a volume is mounted from is in use.
-    std::string mounted;
-    ASSERT_EQ(0, run({"findmnt", "-no", "SOURCE", xfs}, &mounted));
+    const std::string mounted = run({"findmnt", "-no", "SOURCE", xfs});
     snprintf(again.location, sizeof again.location, "%s", mounted.c_str());
     EXPECT_EQ(NORV_ERR_LUN_LOCATION, NORViSCSILunCreate(&again)) << iscsi_host_last_error();
 

@@ -10,7 +10,7 @@ namespace {
 
 using ISCSI::ISCSILUNInfo;
 
-constexpr int QUIET = 1, LOCKED = 2, MAPPED = 4, EXTENT_SIZE = 8, ALLOCATED_SIZE = 16, STATUS = 32;
+constexpr int LOCKED = 2, MAPPED = 4, EXTENT_SIZE = 8, ALLOCATED_SIZE = 16, STATUS = 32;
 
 const char *const EVERY_FIELD =
     "uuid: 1a2b3c4d-0000-4000-8000-000000000003 ,lun_id: 3 ,name: vol1 ,type: ADV ,location: /volume1"
@@ -51,21 +51,6 @@ TEST_F(LUNRecord, AbsurdTimesStillRender)
         lun.restored_time = time;
         EXPECT_NE(lun.toString().find(" ,restored_time: "), std::string::npos);
     }
-}
-
-TEST_F(LUNRecord, IsBuiltFromACreationRequestOrASelection)
-{
-    const ISCSILUNInfo request(NORV_LUN_TYPE_THIN, GIB, "new", "/volume1", 4096);
-    EXPECT_EQ(request.toString(),
-              "uuid:  ,lun_id: 0 ,name: new ,type: THIN ,location: /volume1 ,is_action_locked: false"
-              " ,is_mapped: false ,size: 1073741824 (1GB) ,extent_size: 4096 (4KB) ,allocated_size: 0 (0bytes)"
-              " ,status:  ,restored_time: Thu Jan 01 00:00:00 UTC 1970");
-    EXPECT_TRUE(request.isInvalid());
-
-    ISCSILUNInfo selection(uuidOf(3));
-    EXPECT_FALSE(selection.isInvalid());
-    selection.uuid.clear();
-    EXPECT_EQ(selection.toString(), NO_FIELD);
 }
 
 TEST_F(LUNRecord, FillsTheSDKRecordAtItsOffsets)
@@ -182,20 +167,6 @@ TEST_F(LoadLUN, LiveStateComesInTheOrderOfTheFlags)
     EXPECT_EQ(lun.extent_size, 65536u);
     EXPECT_EQ(lun.allocated_size, 1536u);
     EXPECT_EQ(lun.status, "normal");
-}
-
-TEST_F(LoadLUN, UnknownLUNIsLoggedUnlessQuiet)
-{
-    _tag_iscsi_lun_ record{};
-    EXPECT_EQ(ISCSILUNInfo(uuidOf(9)).loadFromConfig(record, 0), 18990531);
-    EXPECT_EQ(logged(), Lines{"loadFromConfig: Failed to load LUN info from SDK. LUN UUID: " + uuidOf(9)});
-    EXPECT_EQ(ISCSILUNInfo(uuidOf(9)).loadFromConfig(record, QUIET | STATUS), 18990531);
-    EXPECT_EQ(logged(), Lines());
-    called();
-
-    EXPECT_EQ(ISCSILUNInfo().loadFromConfig(record, QUIET), 18990530);
-    EXPECT_EQ(logged(), Lines{"loadFromConfig: No LUN UUID"});
-    EXPECT_EQ(called(), Lines());
 }
 
 // JSON.

@@ -79,16 +79,6 @@ TEST_F(SnapshotLookup, KeepsWhatCameBeforeAFailingFact)
     EXPECT_EQ(fake::unfreedAnswers(), 0);
 }
 
-TEST_F(SnapshotLookup, ByLUNAndName)
-{
-    std::string uuid = "untouched";
-    EXPECT_EQ(ISCSISnapshotInfo::GetUUIDByLIDAndSnapshotName(4, "nothing", uuid), 18990532);
-    EXPECT_EQ(uuid, "untouched");
-    EXPECT_EQ(logged(), Lines{"GetUUIDByLIDAndSnapshotName: No such snapshot. lid: 4, name: nothing"});
-    EXPECT_EQ(ISCSISnapshotInfo::GetUUIDByLIDAndSnapshotName(4, "snap_1", uuid), 0);
-    EXPECT_EQ(uuid, snapshotUUIDOf(4, 1));
-}
-
 TEST_F(SnapshotLookup, SelectorsThatResolve)
 {
     const std::string unknown = "FFFFFFFF-ffff-FFFF-ffff-00000000000a";

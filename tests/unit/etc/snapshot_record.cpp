@@ -220,15 +220,10 @@ TEST_F(SnapshotRecord, LoadsWhatTheFlagsAskFor)
         EXPECT_EQ(snapshot.locked_app_keys, c.keys);
     }
 
-    const std::string unknown = "5E4D3C2B";
     addSnapshot(7, 4, "other").record.uuid[0] = '\0'; // a platform that leaves the UUID out
     snapshot = ISCSISnapshotInfo("");
     EXPECT_EQ(snapshot.loadFromConfig(0), 18990201);
     EXPECT_EQ(logged(), Lines{"loadFromConfig: Snapshot UUID is empty."});
-    snapshot = ISCSISnapshotInfo(unknown);
-    EXPECT_EQ(snapshot.loadFromConfig(3), 18990532);
-    EXPECT_EQ(logged(), Lines{"loadFromConfig: Failed to load snapshot config. UUID: " + unknown});
-    EXPECT_EQ(snapshot.uuid, unknown);
 }
 
 TEST_F(SnapshotRecord, ARecordWithoutASnapshotIsFilledFirst)

@@ -97,16 +97,6 @@ TEST_F(SnapshotOperations, TakeRefusesTextsThatDoNotFitInOrder)
     EXPECT_EQ(fake::model().snapshots.at({3, 1}).record.desc, note.substr(1));
 }
 
-TEST_F(SnapshotOperations, ASnapshotWithoutAWorkerStays)
-{
-    fake::failCall("NLIBCProcForkChildNoWait", 1, -1);
-    EXPECT_EQ(take(), 18990014);
-    EXPECT_EQ(uuid + " " + std::to_string(number), TAKEN + " 1");
-    EXPECT_EQ(logged(), Lines{standardLine("takeSnapshot: Failed to fork a process", no_fork)});
-    EXPECT_EQ(called().back(), forked);
-    EXPECT_EQ(fake::model().snapshots.size(), 2u);
-}
-
 /// A guard or a buffer of the caller's that a worker would see off.
 struct Guard {
     ~Guard() { syslog(LOG_ERR, "lun/snapshots.cpp:1:guard destroyed"); }

@@ -58,7 +58,7 @@ TEST_F(Transfers, ExportStartsAndItsCancelWaits)
 
 TEST_F(Transfers, ASuccessfulImportEndsWithASnapshotLikeTheExported)
 {
-    writeFile(progress_file, "step=0\n");
+    writeFile(progress_file, "step=\"0\"\n");
     EXPECT_EQ(lun.importLUN("/export"), 0);
     EXPECT_EQ(
         called(),
@@ -102,26 +102,6 @@ TEST_F(Transfers, AnImportThatIsNoSuccessTakesNoSnapshot)
             EXPECT_EQ(lines[1], closingLine(c.error));
         }
     }
-}
-
-TEST_F(Transfers, TheWorkerNamesWhatItMissed)
-{
-    EXPECT_EQ(lun.importLUN("/nothing"), 18990011);
-    EXPECT_EQ(called().size(), 2u) << "no worker";
-    EXPECT_EQ(logged(), Lines{standardLine("Failed to import to LUN.", "18990011 (File not found)")});
-
-    writeFile(progress_file, "step=\"0\"\n");
-    fake::failCall("NORViSCSISnapshotExportConfigGet", 1, INJECTED);
-    EXPECT_EQ(lun.importLUN("/export"), 0);
-    EXPECT_EQ(logged(), (Lines{standardLine("Failed to get export config from directory '/export'", INJECTED_ERROR),
-                               closingLine(INJECTED_ERROR)}));
-
-    fake::failCall("NLIBCProcForkChildNoWait", 2, -1);
-    EXPECT_EQ(lun.importLUN("/export"), 0);
-    const Lines lines = logged();
-    ASSERT_EQ(lines.size(), 3u);
-    EXPECT_EQ(lines[1], standardLine("Failed to take snapshot when import done.", "18990014 (Failed to fork)"));
-    EXPECT_EQ(lines[2], closingLine("18990014 (Failed to fork)"));
 }
 
 TEST_F(Transfers, ImportCancelWaits)
