@@ -1,7 +1,6 @@
 #include "iscsiwebapi/ISCSILIBTarget.h"
 #include "tests/unit/Library.h"
 
-
 namespace unit {
 namespace {
 
