@@ -170,7 +170,8 @@ private:
     PairedNode peer;
     std::vector<DataRange> ranges;
     uint64_t total = 0, moved_before = 0;
-    uint64_t offset = 0;   ///< what lies below it is flushed on the peer, which knows
+    uint64_t flushed = 0;  ///< what lies below it is flushed on the peer
+    uint64_t offset = 0;   ///< ... and the peer was told so
     std::string sink_name; ///< of the peer's opening
     bool to_zeros = false;
     bool was_full = false; ///< the peer's volume, when it was tried last
@@ -250,7 +251,7 @@ void Sender::run()
 int Sender::findCause(OpenSink &sink, int err)
 {
     const std::string reason = lastError();
-    const int told = note(offset); // nothing new, but a peer that wants no more of it says so
+    const int told = note(flushed); // and a peer that wants no more of it says so
     if (isFinal(told))
         return told;
     bool full = false;
@@ -294,7 +295,7 @@ int Sender::adapt(const Json::Value &reception)
     if (!holding.isString() || !reception["offset"].isUInt64())
         return fail(NORV_ERR_BAD_RESPONSE, "the peer does not say what its LUN holds");
     to_zeros = holding == "zeros";
-    offset = reception["offset"].asUInt64();
+    offset = flushed = reception["offset"].asUInt64();
     if (holding != (base_file ? "base" : "zeros")) {
         if (int err = describeWhole(file.get(), snapshot.record.total_size, ranges))
             return err;
@@ -310,7 +311,6 @@ int Sender::sendAll(const OpenSink &sink)
     if (left.empty())
         return 0;
     auto next = left.begin();
-    uint64_t flushed = offset;
     noted = Clock::now();
     norvhost::Sending sending;
     sending.to = sink.unit();
@@ -330,7 +330,7 @@ int Sender::sendAll(const OpenSink &sink)
     };
     if (int err = sendRanges(sending))
         return sink.explain(err);
-    offset = snapshot.record.total_size;
+    flushed = snapshot.record.total_size;
     return 0;
 }
 
@@ -343,7 +343,7 @@ int Sender::complete(OpenSink &sink)
     body["total"] = Json::UInt64(total);
     if (int err = askNode(peer, "POST", arrivalPath() + "/end", body, answer)) {
         const std::string reason = lastError();
-        note(offset); // the next try needs not send it again
+        note(flushed); // the next try needs not send it again
         return fail(err, "%s", reason.c_str());
     }
     sink.completed();
