@@ -166,7 +166,7 @@ TEST_F(ReceptionTest, ALunThatIsNoSinkAnyMoreIsLeftAlone)
     norvhost::LunRow row;
     ASSERT_EQ(norvhost::loadLunByLid(lun.lid, row), 0);
     ASSERT_EQ(norvhost::releaseSink(row), 0) << iscsi_host_last_error(); // a removal that was killed goes no further
-    put('y');                                                           // by an initiator
+    put('y');                                                            // by an initiator
     Reception reception;
     EXPECT_EQ(iscsihost::beginReception(task_uuid, {second, first, "second"}, reception), NORV_ERR_LUN_TYPE);
     EXPECT_EQ(iscsihost::breakReception(task_uuid), NORV_ERR_LUN_TYPE);
