@@ -15,6 +15,7 @@ LONG = bool(os.environ.get("ISCSIWEBAPI_LONG"))
 KILLS = 120 if LONG else 12
 CUTS = (1, 10, 60) if LONG else (1, 10)
 SLOWER = "40mbit"  # there is time to flush
+SLOWEST = "16mbit"  # a change is under way for seconds
 READ_WRITE, READ_ONLY = 3261, 3262
 
 
@@ -165,7 +166,7 @@ class Faults(ReplicationTest):
         for number, seconds in enumerate(CUTS):
             with self.subTest(seconds=seconds):
                 self.change_much(random.Random(number))
-                snapshot = self.begin(f"cut for {seconds} s", after_mib=1)
+                snapshot = self.begin(f"cut for {seconds} s", after_mib=1, rate=SLOWEST)
                 self.two.cut_link()
                 time.sleep(seconds)  # how long it is cut, not a wait
                 self.two.mend_link()
@@ -252,7 +253,7 @@ class Faults(ReplicationTest):
         self.assertEqual(self.there(first)["name"], "first", "it was taken again before it was overwritten")
 
         self.change_much(random.Random(1))
-        third = self.begin("third", after_mib=1)
+        third = self.begin("third", after_mib=1, rate=SLOWEST)
         self.refused(self.one, "snapshot", "delete", second, "--yes", says="locked")
         self.killed(self.senders())
         self.give_up()
@@ -296,7 +297,7 @@ class Faults(ReplicationTest):
         self.send(first := self.take("first"))
         wanted = checksum_at(self.one, "data")
         self.change_much(random.Random(2))
-        self.begin(after_mib=1)
+        self.begin(after_mib=1, rate=SLOWEST)
         self.two.iscsictl("replication", "promote", self.task)
         self.full_speed()
         self.wait_idle()
