@@ -49,7 +49,7 @@ Progress askTransfer(const Transfer &transfer, const std::function<bool()> &comp
     const int step = told["step"].asInt();
     if (progress.running || step == 0 || (step == transfer.idle && complete()))
         return progress;
-    if (step == transfer.idle || step == transfer.busy)
+    if (step == transfer.idle || step == transfer.busy || step == transfer.interrupted)
         throw Failure{transfer.interrupted, "it was stopped before its end"};
     throw Failure{step, ""};
 }
@@ -83,15 +83,13 @@ void addExport(Commands &commands, CLI::App &noun)
         action.title = "Exporting " + a->selector + " to " + destination;
         action.later = "'iscsictl snapshot show' tells how far it is, 'iscsictl snapshot export-cancel' stops it";
         action.ask = [transfer = exportOf(a->selector), destination] {
-            // An export's record gets its name last. Of another machine nobody can tell it.
+            // An export's record gets its name last.
             return askTransfer(transfer, [&] {
                 std::error_code ignored;
-                return remote() || std::filesystem::exists(destination + "/export.record", ignored);
+                return !remote() && std::filesystem::exists(destination + "/export.record", ignored);
             });
         };
-        run(*a, action,
-            remote() ? "The export of " + a->selector + " has ended"
-                     : "Exported " + a->selector + " to " + destination);
+        run(*a, action, "Exported " + a->selector + " to " + destination);
     });
     addPositional(verb, "SNAPSHOT", a->selector, SNAPSHOT_HELP);
     addPositional(verb, "DIRECTORY", *folder, "Directory for the export, made if missing");

@@ -156,18 +156,23 @@ int TransferJob::finishing(const std::function<int()> &check)
 
 void TransferJob::end(int code)
 {
-    if (code == -ECANCELED || (code == 0 && id.isExport()))
-        progress.remove();
-    else
-        progress.finish(code);
-    if (removeRow(id) != 0)
-        syslog(LOG_WARNING, "left to the next sweep: %s", lastError());
+    const int interrupt = id.isExport() ? NORV_ERR_EXPORT_INTERRUPT : NORV_ERR_IMPORT_INTERRUPT;
+    progress.finish(code == -ECANCELED ? interrupt : code);
+    forgetRow();
 }
 
 void TransferJob::drop()
 {
-    if (id.lid)
-        end(-ECANCELED);
+    if (!id.lid)
+        return;
+    progress.remove();
+    forgetRow();
+}
+
+void TransferJob::forgetRow()
+{
+    if (removeRow(id) != 0)
+        syslog(LOG_WARNING, "left to the next sweep: %s", lastError());
 }
 
 int cancelTransfer(const TransferId &id)

@@ -31,13 +31,16 @@ public:
     /// transaction.
     int finishing(const std::function<int()> &check);
 
-    /// Ends it with this code. A finished export and whatever was stopped leaves no progress file.
+    /// Ends it with this code. Its progress file stays for a while and tells how it ended: a reader, who opens it once
+    /// for each value, would otherwise find it gone between two of them.
     void end(int code);
 
     /// Forgets one that did not come to run.
     void drop();
 
 private:
+    void forgetRow();
+
     TransferId id;   ///< empty until it has a row
     NamedLock alive; ///< held as long as somebody works on it
     TransferProgress progress;

@@ -134,7 +134,7 @@ class Snapshots(Appliance):
         self.assertRegex(result.stdout, "^Took snapshot one of LUN vm: ")
         exported = os.path.join(self.folder, "exported")
         result = self.run_cli("snapshot", "export", "vm_one", exported, "--watch")
-        self.assertEqual((result.returncode, result.stdout), (0, f"Exported vm_one to {exported}\n"))
+        self.assertEqual((result.returncode, result.stdout), (0, f"Exported vm_one to {exported}\n"), result.stderr)
         for line in result.stderr.splitlines():
             self.assertRegex(line, rf"^Exporting vm_one to {re.escape(exported)}: (\d+:\d\d|\d+% of 12M(, .*/s, .* left)?)$")
         self.write(b"2", megabytes=12)
