@@ -32,6 +32,14 @@ std::string lockName(const char *task_uuid)
     return std::string("unsync-") + task_uuid;
 }
 
+/// `counting` is asked before the count: a worker that ends in between has written it.
+int readCount(const std::string &uuid, UnsyncCount &count, bool &counting)
+{
+    if (int err = namedLockHeld(lockName(uuid.c_str()), counting))
+        return err;
+    return loadUnsyncCount(uuid, count);
+}
+
 } // namespace
 
 int NORViSCSIReplicationTaskUnsyncSizeComputeStart(const _tag_iscsi_task_ *task, const _tag_iscsi_snapshot_ *base,
@@ -75,15 +83,16 @@ int NORViSCSIReplicationTaskUnsyncSizeGet(const _tag_iscsi_task_ *task, uint64_t
     if (!task || !size || !completed)
         return fail(NORV_ERR_NULL_POINTER, "an argument is missing");
     const std::string uuid = lowerCase(std::string_view(task->uuid, strnlen(task->uuid, sizeof task->uuid)));
-    NamedLock lock; // asked before the count: a worker that ends in between has written it
-    if (int err = lock.tryTake(lockName(uuid.c_str())))
-        return err;
     UnsyncCount count;
-    if (int err = loadUnsyncCount(uuid, count))
+    bool counting = false;
+    if (int err = readCount(uuid, count, counting))
         return err;
+    if (!counting && !count.completed && !count.error) // it may have been begun, even ended, in between
+        if (int err = readCount(uuid, count, counting))
+            return err;
     if (count.error)
         return fail(count.error, "the unsynchronised size could not be counted");
-    if (!count.completed && lock.held())
+    if (!count.completed && !counting)
         return fail(NORV_ERR_COMPUTE_UNSYNC_SIZE, "nobody counts the unsynchronised size of the task: start it again");
     *size = count.bytes;
     *completed = count.completed;
