@@ -97,20 +97,25 @@ int sweepRow(const TransferRow &row, const FileDescriptor &progress_folder)
     return 0;
 }
 
+bool endedLately(const FileDescriptor &folder, const char *name)
+{
+    struct stat status;
+    if (fstatat(folder.get(), name, &status, AT_SYMLINK_NOFOLLOW) != 0)
+        return false;
+    const time_t now = time(nullptr);
+    return status.st_mtime <= now && now - status.st_mtime < outcome_seconds;
+}
+
 /// Removes the progress files of transfers that ended a while ago.
 void sweepOutcomes(FileDescriptor &folder)
 {
     const std::unique_ptr<DIR, int (*)(DIR *)> listing(fdopendir(dup(folder.get())), closedir);
-    const time_t now = time(nullptr);
     TransferId id;
-    struct stat status;
     while (const dirent *entry = listing ? readdir(listing.get()) : nullptr) {
-        if (!parseProgressFileName(entry->d_name, id) ||
-            fstatat(folder.get(), entry->d_name, &status, AT_SYMLINK_NOFOLLOW) != 0 ||
-            (status.st_mtime <= now && now - status.st_mtime < outcome_seconds))
+        if (!parseProgressFileName(entry->d_name, id))
             continue;
-        NamedLock alive;
-        if (alive.tryTake(lockName(id)) == 0 && alive.held())
+        NamedLock alive; // before the look at the file: until it is removed no other transfer of that name ends
+        if (alive.tryTake(lockName(id)) == 0 && alive.held() && !endedLately(folder, entry->d_name))
             removeProgressFile(folder, id);
     }
 }
