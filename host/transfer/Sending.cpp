@@ -459,6 +459,7 @@ int Sender::flush()
 void Sender::logOut()
 {
     answer_came = false;
+    last_movement = Clock::now();
     if (iscsi_logout_async(session.get(), connected, this) == 0)
         while (!answer_came && serve(false, logout_limit) == 0)
             ;

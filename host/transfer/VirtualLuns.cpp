@@ -146,8 +146,11 @@ private:
 
 int SenderJob::prepare(const char *portal, const char *node_uuid, const char *sink_uuid)
 {
-    if (int err = lock.tryTake(lockName(row.uuid)))
-        return err;
+    int lock_err = 0;
+    // Who has told its end lets go of the lock soon.
+    waitFor(row.ended ? stop_limit : 0s, [&] { return (lock_err = lock.tryTake(lockName(row.uuid))) || lock.held(); });
+    if (lock_err)
+        return lock_err;
     if (!lock.held())
         return fail(NORV_ERR_LUN_LOCKED, "the virtual LUN is sending already");
     LunRow lun;
