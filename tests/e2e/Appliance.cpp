@@ -17,8 +17,6 @@
 
 namespace e2e {
 
-using namespace std::chrono_literals;
-
 const std::string alice = "iqn.2026-01.example:alice", bob = "iqn.2026-01.example:bob",
                   mallory = "iqn.2026-01.example:mallory";
 const norvhost::Tgtd Appliance::rw(norvhost::Access::read_write), Appliance::ro(norvhost::Access::read);
@@ -147,7 +145,8 @@ void Appliance::killProcess(pid_t pid)
 {
     ASSERT_GT(pid, 1);
     kill(pid, SIGKILL);
-    EXPECT_TRUE(norvhost::waitFor(5s, [=] { return kill(pid, 0) != 0 || waitpid(pid, nullptr, WNOHANG) == pid; }));
+    EXPECT_TRUE(
+        norvhost::waitFor(hang_limit, [=] { return kill(pid, 0) != 0 || waitpid(pid, nullptr, WNOHANG) == pid; }));
 }
 
 pid_t Appliance::portalProcess()
@@ -213,7 +212,7 @@ int main(int argc, char **argv)
                                                         {"mount", "--make-rprivate", "/"},
                                                         {"mount", "-t", "tmpfs", "tmpfs", "/mnt"},
                                                         {"mount", "-t", "proc", "proc", "/proc"}})
-            if (norvhost::runProgram({command, {}, 10}, result) || result.status != 0) {
+            if (norvhost::runProgram({command, {}, 60}, result) || result.status != 0) {
                 fprintf(stderr, "%s failed: %s\n", command[0].c_str(), result.errors.c_str());
                 _exit(1);
             }

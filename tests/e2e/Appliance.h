@@ -6,6 +6,7 @@
 #include "platform/iscsi_masking.h"
 #include "platform/iscsi_target.h"
 
+#include <chrono>
 #include <cstring>
 #include <functional>
 #include <gtest/gtest.h>
@@ -16,6 +17,9 @@
 namespace e2e {
 
 constexpr uint64_t MiB = 1 << 20;
+
+/// What takes longer hangs: a busy machine may take its time.
+constexpr std::chrono::seconds hang_limit(60);
 
 /// Initiator names.
 extern const std::string alice, bob, mallory;

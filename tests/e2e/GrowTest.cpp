@@ -15,8 +15,6 @@
 namespace e2e {
 namespace {
 
-using namespace std::chrono_literals;
-
 constexpr int in_flight = 32;
 constexpr uint32_t request_blocks = 128;
 constexpr int slots = 128; ///< requests that fit into the smallest LUN
@@ -128,7 +126,7 @@ private:
                     send(slot);
             }
             pollfd event = {iscsi_get_fd(initiator.get()), static_cast<short>(iscsi_which_events(initiator.get())), 0};
-            if (poll(&event, 1, 20000) <= 0 || iscsi_service(initiator.get(), event.revents) != 0) {
+            if (poll(&event, 1, 60000) <= 0 || iscsi_service(initiator.get(), event.revents) != 0) {
                 failed("the connection broke: " + initiator.error());
                 break;
             }
@@ -164,7 +162,8 @@ TEST_F(GrowTest, AMappedLunGrowsUnderLoad)
         EXPECT_EQ(grow(store.lun, size), 0) << iscsi_host_last_error();
         EXPECT_EQ(watcher.capacity(), size);
         done = load.done;
-        EXPECT_TRUE(norvhost::waitFor(10s, [&] { return load.done > done + in_flight; })) << "the load stands still";
+        EXPECT_TRUE(norvhost::waitFor(hang_limit, [&] { return load.done > done + in_flight; }))
+            << "the load stands still";
     }
     load.stop();
     EXPECT_EQ(load.failures, 0) << load.first_failure;
@@ -190,7 +189,8 @@ TEST_F(GrowTest, AKilledGrowNeitherFailsNorHoldsUpTheLoad)
         kill(child, SIGKILL);
         waitForChild(child);
         const uint64_t done = load.done;
-        EXPECT_TRUE(norvhost::waitFor(10s, [&] { return load.done > done + in_flight; })) << "the load stands still";
+        EXPECT_TRUE(norvhost::waitFor(hang_limit, [&] { return load.done > done + in_flight; }))
+            << "the load stands still";
         // A repeated command mends what the killed one left, as a further one does.
         if (i % 2)
             size += 2 * MiB;
@@ -213,9 +213,9 @@ TEST_F(GrowTest, ALunUnderLoadCanBeTakenAway)
         Load load(alice, store.target.iqn);
         ASSERT_TRUE(load.isConnected());
         load.start();
-        EXPECT_TRUE(norvhost::waitFor(10s, [&] { return load.done > 100; }));
+        EXPECT_TRUE(norvhost::waitFor(hang_limit, [&] { return load.done > 100; }));
         EXPECT_EQ(take(), 0) << iscsi_host_last_error();
-        EXPECT_TRUE(norvhost::waitFor(10s, [&] { return load.failures > 0; }));
+        EXPECT_TRUE(norvhost::waitFor(hang_limit, [&] { return load.failures > 0; }));
         load.stop();
         EXPECT_TRUE(shown(rw, store.target.tid).units.empty());
         if (shown(rw, store.target.tid).tid)

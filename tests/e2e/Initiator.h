@@ -24,7 +24,7 @@ public:
     explicit Initiator(const std::string &name, std::string address = "127.0.0.1")
         : context(iscsi_create_context(name.c_str())), address(std::move(address))
     {
-        iscsi_set_timeout(context.get(), 20);
+        iscsi_set_timeout(context.get(), 60);
     }
 
     iscsi_context *get() const { return context.get(); }

@@ -6,7 +6,7 @@
 #include "host/target/Wait.h"
 
 #include <arpa/inet.h>
-#include <chrono>
+#include <atomic>
 #include <filesystem>
 #include <random>
 #include <sys/socket.h>
@@ -15,8 +15,6 @@
 
 namespace e2e {
 namespace {
-
-using namespace std::chrono_literals;
 
 class PortalTest : public Appliance {
 protected:
@@ -90,7 +88,7 @@ TEST_F(PortalTest, GarbageEndsItsConnectionAndNothingElse)
     }
     EXPECT_EQ(portalProcess(), portal);
     EXPECT_EQ(Initiator(alice).discover().count(store.target.iqn), 1u);
-    EXPECT_TRUE(norvhost::waitFor(5s, [&] { return openDescriptors(portal) == descriptors; }))
+    EXPECT_TRUE(norvhost::waitFor(hang_limit, [&] { return openDescriptors(portal) == descriptors; }))
         << "descriptors are left";
 }
 
@@ -138,16 +136,17 @@ TEST_F(PortalTest, AnUnknownNameWaitsForARunningChange)
     setDefault(store.target, NORV_AUTHORITY_READ);
     norvhost::ServiceLock change;
     ASSERT_EQ(change.take(), 0);
+    std::atomic<bool> ended{false};
     std::thread later([&] {
         Initiator listed(bob);
         EXPECT_TRUE(listed.logIn(store.target.iqn)) << "a listed name does not wait";
-        poll(nullptr, 0, 300);
+        poll(nullptr, 0, 300); // how long the change takes, not a wait
+        ended = true;
         change = norvhost::ServiceLock();
     });
-    const auto before = std::chrono::steady_clock::now();
     Initiator guest(mallory);
     EXPECT_TRUE(guest.logIn(store.target.iqn)) << guest.error();
-    EXPECT_GE(std::chrono::steady_clock::now() - before, 250ms);
+    EXPECT_TRUE(ended);
     later.join();
 }
 

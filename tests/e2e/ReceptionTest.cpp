@@ -50,7 +50,7 @@ protected:
     {
         EXPECT_EQ(norvhost::stopService(), 0) << iscsi_host_last_error();
         norvhost::ProgramResult result;
-        EXPECT_EQ(norvhost::runProgram({{"umount", root + "/xfs"}, {}, 10}, result), 0);
+        EXPECT_EQ(norvhost::runProgram({{"umount", root + "/xfs"}, {}, 60}, result), 0);
         EXPECT_EQ(result.status, 0) << result.errors;
     }
 

@@ -19,8 +19,6 @@
 namespace e2e {
 namespace {
 
-using namespace std::chrono_literals;
-
 class ServiceTest : public Appliance {
 protected:
     /// Both daemons show what the store says, and nothing else.
@@ -137,7 +135,7 @@ TEST_F(ServiceTest, ASupervisedServiceHealsWhileAnInitiatorWorks)
     const Store store = createStore();
     ASSERT_EQ(norvhost::stopService(), 0);
     const pid_t supervisor = inChild([] { return norvhost::superviseService(); });
-    ASSERT_TRUE(norvhost::waitFor(10s, [] { return norvhost::iscsiServiceAlive(); }));
+    ASSERT_TRUE(norvhost::waitFor(hang_limit, [] { return norvhost::iscsiServiceAlive(); }));
     Initiator session(alice);
     ASSERT_TRUE(session.logIn(store.target.iqn));
     for (pid_t victim : {rw.processId(), ro.processId(), portalProcess()}) {
@@ -146,7 +144,7 @@ TEST_F(ServiceTest, ASupervisedServiceHealsWhileAnInitiatorWorks)
         clearAttention(session.get(), 1); // it reconnects by itself
         EXPECT_TRUE(session.write(8, 0x5b)) << session.error();
         EXPECT_TRUE(session.holds(0, 0x5a)) << session.error();
-        EXPECT_TRUE(norvhost::waitFor(10s, [] { return norvhost::iscsiServiceAlive(); }));
+        EXPECT_TRUE(norvhost::waitFor(hang_limit, [] { return norvhost::iscsiServiceAlive(); }));
     }
     expectDaemonsAsStored();
     kill(supervisor, SIGTERM);

@@ -16,14 +16,11 @@
 #include <cstring>
 #include <fcntl.h>
 #include <iscsi/scsi-lowlevel.h>
-#include <set>
 #include <thread>
 #include <unistd.h>
 
 namespace e2e {
 namespace {
-
-using namespace std::chrono_literals;
 
 class SnapshotTest : public Appliance {
 protected:
@@ -46,7 +43,7 @@ protected:
     {
         EXPECT_EQ(norvhost::stopService(), 0) << iscsi_host_last_error();
         norvhost::ProgramResult result;
-        EXPECT_EQ(norvhost::runProgram({{"umount", root + "/xfs"}, {}, 10}, result), 0);
+        EXPECT_EQ(norvhost::runProgram({{"umount", root + "/xfs"}, {}, 60}, result), 0);
         EXPECT_EQ(result.status, 0) << result.errors;
     }
 
@@ -76,9 +73,9 @@ TEST_F(SnapshotTest, NeverHoldsALaterWriteWithoutTheEarlierOne)
     scatter();
     OrderedWriter writer(store.target.iqn, store.lun.size);
     ASSERT_TRUE(writer.connected);
-    std::set<uint64_t> seen;
     uint64_t before = 0;
     for (int i = 0; i < 60; ++i) {
+        EXPECT_TRUE(norvhost::waitFor(hang_limit, [&] { return writer.number > before; })) << "the writer stands still";
         const uint64_t acknowledged = writer.number;
         const _tag_iscsi_snapshot_ snapshot = take("s" + std::to_string(i));
         const std::string path = norvhost::snapshotDataPath(snapshot);
@@ -87,11 +84,9 @@ TEST_F(SnapshotTest, NeverHoldsALaterWriteWithoutTheEarlierOne)
         EXPECT_GE(second, acknowledged) << "an acknowledged write is missing";
         EXPECT_LE(before, second);
         before = second;
-        seen.insert(first);
         EXPECT_EQ(NORViSCSISnapshotDelete(&snapshot, "test"), 0) << iscsi_host_last_error();
     }
     EXPECT_FALSE(writer.failed) << "the initiator saw a failure";
-    EXPECT_LT(30u, seen.size()) << "the writer stood still";
 }
 
 TEST_F(SnapshotTest, RestoresUnderASession)
@@ -119,7 +114,7 @@ TEST_F(SnapshotTest, TheSupervisorCompletesARestoreThatWasCutShort)
     ASSERT_EQ(norvhost::markRestore(store.lun.lid, snapshot.uuid), 0);
     ASSERT_TRUE(writer.holds(0, 0x22)) << "the service itself looks for nothing";
     const pid_t supervisor = inChild([] { return norvhost::superviseService(); });
-    EXPECT_TRUE(norvhost::waitFor(10s, [&] { return writer.holds(0, 0x11); }));
+    EXPECT_TRUE(norvhost::waitFor(hang_limit, [&] { return writer.holds(0, 0x11); }));
     kill(supervisor, SIGTERM);
     EXPECT_EQ(waitForChild(supervisor), 0);
 }
