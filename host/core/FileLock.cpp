@@ -19,11 +19,17 @@ using Clock = std::chrono::steady_clock;
 
 constexpr int ask_again_ms = 20;
 
-bool setLock(int fd, int type)
+struct flock wholeFile(int type)
 {
     struct flock lock = {};
     lock.l_type = static_cast<short>(type);
     lock.l_whence = SEEK_SET;
+    return lock;
+}
+
+bool setLock(int fd, int type)
+{
+    struct flock lock = wholeFile(type);
     return fcntl(fd, F_OFD_SETLK, &lock) == 0;
 }
 
@@ -76,6 +82,22 @@ int lockWithin(const char *path, int exclusive, std::chrono::seconds limit, int 
 }
 
 } // namespace
+
+int norvhost::fileLockHeld(const char *path, bool &held)
+{
+    FilePlace place;
+    FileDescriptor file;
+    struct flock lock = wholeFile(F_WRLCK);
+    int err = openPlace(path, place);
+    if (!err)
+        err = openOwnFile(place, O_RDWR, file);
+    if (!err && fcntl(file.get(), F_OFD_GETLK, &lock) != 0) {
+        err = -errno;
+        failErrno(NORV_ERR_LOCK_FILE, errno, "cannot ask for the lock %s", path);
+    }
+    held = !err && lock.l_type != F_UNLCK;
+    return err == -ENOENT ? 0 : err;
+}
 
 int NLIBCFileLockByFile(const char *path, int exclusive, int *fd)
 {

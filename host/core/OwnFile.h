@@ -28,4 +28,8 @@ int openOwnFile(const FilePlace &place, int flags, FileDescriptor &file);
 /// others must not write to it.
 int makeOwnFolder(const char *path);
 
+/// Whether somebody holds the lock that NLIBCFileLockByFile() takes; a file that is not there has none. Asked without
+/// taking it, which would refuse whoever wants it just then.
+int fileLockHeld(const char *path, bool &held);
+
 } // namespace norvhost

@@ -1,5 +1,6 @@
 /// The platform's replication tasks: storing, listing, roles.
 #include "host/core/LastError.h"
+#include "host/core/OwnFile.h"
 #include "host/replication/Roles.h"
 #include "host/replication/Sending.h"
 #include "host/replication/TaskStore.h"
@@ -7,6 +8,7 @@
 #include "host/state/Fields.h"
 #include "host/storage/LunStore.h"
 #include "host/storage/MapFile.h"
+#include "iscsihost/replication.h"
 #include "platform/error.h"
 #include "platform/replication.h"
 
@@ -77,6 +79,11 @@ int loadCallersTask(const _tag_iscsi_task_ *task, TaskRow &row)
 }
 
 } // namespace
+
+int iscsihost::isTaskLocked(const std::string &lock_file, bool &is_locked)
+{
+    return fileLockHeld(lock_file.c_str(), is_locked) == 0 ? 0 : NORV_ERR_LOCK_FILE;
+}
 
 int NORViSCSIReplicationTaskConfGetByUUID(const char *uuid, _tag_iscsi_task_ *task)
 {

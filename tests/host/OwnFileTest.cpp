@@ -2,6 +2,7 @@
 #include "HostTest.h"
 #include "KillAt.h"
 
+#include "host/core/OwnFile.h"
 #include "platform/core.h"
 
 #include <fstream>
@@ -62,6 +63,12 @@ struct OwnFileTest : HostTest {
     }
     void write(const std::string &text) { std::ofstream(path) << text; }
     int tryLock() { return lockWithin(0); }
+    bool isHeld()
+    {
+        bool held = false;
+        EXPECT_EQ(0, fileLockHeld(lock.c_str(), held)) << iscsi_host_last_error();
+        return held;
+    }
     int lockWithin(int seconds)
     {
         int fd = -1;
@@ -232,6 +239,7 @@ TEST_F(OwnFileTest, AnotherUsersFilesAreRefusedNeedsRoot)
 TEST_F(OwnFileTest, ALockBelongsToAllWhoInheritedItUntilOneReleasesIt)
 {
     int fd = -1;
+    EXPECT_FALSE(isHeld()) << "there is no file yet";
     ASSERT_EQ(1, NLIBCFileLockByFile(lock.c_str(), 1, &fd)) << iscsi_host_last_error();
     EXPECT_EQ(0, tryLock()) << "another opening of the file";
 
@@ -243,6 +251,7 @@ TEST_F(OwnFileTest, ALockBelongsToAllWhoInheritedItUntilOneReleasesIt)
     });
     close(fd); // as a caller's end does
     EXPECT_EQ(0, tryLock()) << "the worker has it";
+    EXPECT_TRUE(isHeld());
     const pid_t waiter = inChild([&] { return lockWithin(60) == 1 ? 0 : 1; });
     ASSERT_EQ(1, ::write(go[1], "", 1));
     EXPECT_EQ(0, waitForChild(worker));
@@ -255,6 +264,7 @@ TEST_F(OwnFileTest, ALockBelongsToAllWhoInheritedItUntilOneReleasesIt)
         return 1;
     });
     EXPECT_EQ(128 + SIGKILL, waitForChild(killed));
+    EXPECT_FALSE(isHeld());
     EXPECT_EQ(1, tryLock());
     close(go[0]);
     close(go[1]);

@@ -45,21 +45,33 @@ int addProgress(ISCSILIBReplication &replication, Json::Value &out)
     return 0;
 }
 
+/// Loads the task and asks for its lock. The library's getStatus() takes the lock for a moment, and who wants it just
+/// then is refused.
+int loadTask(ISCSILIBReplication &replication, bool &is_locked)
+{
+    if (int err = replication.task.loadFromConfig(replication.task_record, true))
+        return err;
+    return iscsihost::isTaskLocked(replication.task.getLockPath(), is_locked);
+}
+
 /// The task's JSON form with names, its lock and its base version.
 Result describe(const std::string &uuid)
 {
     ISCSILIBReplication replication(uuid);
+    ISCSITaskInfo &task = replication.task;
     bool is_locked = false;
     std::string base_version;
-    if (int err = replication.getStatus(is_locked, base_version))
+    if (int err = loadTask(replication, is_locked))
+        return failed(err);
+    ISCSILUNInfo &lun = task.is_source ? task.src_lun : task.dst_lun;
+    if (int err = lun.getBaseVersion(base_version))
         return failed(err);
     Result result;
-    const ISCSITaskInfo &task = replication.task;
     if (int err = task.toJsonFormat(result.value))
         return failed(err);
     result.value["is_locked"] = is_locked;
     result.value["base_version"] = base_version;
-    result.value["lun_name"] = (task.is_source ? task.src_lun : task.dst_lun).name;
+    result.value["lun_name"] = lun.name;
     result.value["peer"] = (task.is_source ? task.dst_node : task.src_node).hostname;
     return result;
 }
@@ -135,14 +147,13 @@ Result showSending(const Request &request)
 {
     return withTask(request, [](ISCSILIBReplication &replication) {
         Result result;
-        result.value = Json::objectValue;
-        if (int err = addProgress(replication, result.value))
-            return failed(err);
         bool is_locked = false;
-        std::string base_version;
-        if (int err = replication.getStatus(is_locked, base_version))
+        // Asked before the rest: when nobody holds the lock, the rest is how it ended.
+        if (int err = loadTask(replication, is_locked))
             return failed(err);
         result.value["is_locked"] = is_locked;
+        if (int err = addProgress(replication, result.value))
+            return failed(err);
         return result;
     });
 }

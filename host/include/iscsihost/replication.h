@@ -55,6 +55,9 @@ ISCSI_HOST_API int findArrivedSnapshot(const std::string &lun_uuid, int64_t snap
 /// Bytes that have arrived so far of the state that arrives at a LUN; 0 when none does.
 ISCSI_HOST_API int arrivedBytes(const std::string &lun_uuid, uint64_t &bytes);
 
+/// Whether something is done with a task, whose lock file is given.
+ISCSI_HOST_API int isTaskLocked(const std::string &lock_file, bool &is_locked);
+
 /// Why the latest sending of a task failed, in words; empty when it did not, or when its code says all.
 ISCSI_HOST_API int sendingFailure(const std::string &task_uuid, std::string &reason);
 
