@@ -426,7 +426,7 @@ int stopSending(const TaskRow &task)
         return 0;
     if (int err = requestStop(task.record.uuid, true))
         return err;
-    const auto limit = Clock::now() + std::chrono::seconds(10);
+    const auto limit = Clock::now() + std::chrono::seconds(60); // it may be waiting for its peer
     while (isSending(task.record.uuid)) {
         if (Clock::now() > limit)
             return fail(NORV_ERR_TIMEOUT, "the sender of the task %s does not stop", task.record.uuid);

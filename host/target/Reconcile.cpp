@@ -24,6 +24,9 @@ using namespace std::chrono_literals;
 constexpr auto session_end_limit = 2s;
 constexpr auto unit_end_limit = 5s;
 
+/// When nobody sends commands any more: a busy disk takes its time to write what a flush asks for.
+constexpr auto last_commands_limit = 30s;
+
 /// What tgtd takes for our 0, the default; larger than its own 8 KiB, which costs a third of the write speed.
 constexpr uint32_t default_segment = 262144;
 
@@ -182,7 +185,7 @@ int Reconciler::remove(const TgtdTarget &shown)
     }
     int err = 0;
     bool busy = true;
-    waitFor(unit_end_limit, [&] { return (err = daemon.deleteTarget(shown.tid, busy)) || !busy; });
+    waitFor(last_commands_limit, [&] { return (err = daemon.deleteTarget(shown.tid, busy)) || !busy; });
     if (!err && busy)
         err = fail(NORV_ERR_TIMEOUT, "commands of its initiators keep the target %s busy", shown.iqn.c_str());
     return err;
@@ -458,7 +461,7 @@ int Reconciler::removeUnit(int tid, uint64_t lun)
     std::vector<TgtdConnection> connections;
     if ((err = daemon.showConnections(tid, connections)) || (err = closeAll(tid, connections)))
         return err;
-    if (waitFor(unit_end_limit, removed))
+    if (waitFor(last_commands_limit, removed))
         return err;
     return fail(NORV_ERR_TIMEOUT, "commands of its initiators keep unit %llu of target %d busy",
                 static_cast<unsigned long long>(lun), tid);

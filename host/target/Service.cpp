@@ -43,7 +43,8 @@ namespace {
 
 using namespace std::chrono_literals;
 
-constexpr auto start_limit = 10s;
+/// What takes longer hangs: a busy machine may be slow.
+constexpr auto start_limit = 60s, kill_limit = 60s;
 constexpr auto stop_limit = 5s;
 constexpr auto supervise_interval = 5s, retry_interval = 1s, mend_interval = 30s;
 
@@ -147,8 +148,9 @@ int endProcess(Holder holder, int signal)
         return 0;
     pollfd ended = {process.get(), POLLIN, 0};
     for (int next : {signal, SIGKILL}) {
+        const std::chrono::milliseconds limit = next == SIGKILL ? kill_limit : stop_limit;
         pidfd_send_signal(process.get(), next, nullptr, 0);
-        if (poll(&ended, 1, static_cast<int>(std::chrono::milliseconds(stop_limit).count())) > 0) {
+        if (poll(&ended, 1, static_cast<int>(limit.count())) > 0) {
             hasEnded(pid); // it may be our child
             return 0;
         }
