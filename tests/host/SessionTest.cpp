@@ -188,8 +188,11 @@ TEST_F(SessionTest, FailedLogInsDelayTheNextOne)
 {
     addAccount("alice");
     for (int wait : {0, 0, 1, 2, 4, 8, 16, 32, 60, 60}) {
+        const time_t begin = time(nullptr);
         EXPECT_EQ(NORV_ERR_LOGIN, logIn("alice", "wrong", "192.0.2." + std::to_string(wait)));
-        EXPECT_NEAR(wait, delay("alice"), 2);
+        const int64_t left = delay("alice");
+        EXPECT_GE(wait + 1, left);
+        EXPECT_LE(wait, left + 1 + time(nullptr) - begin);
         if (wait > 4) {
             EXPECT_EQ(NORV_ERR_TRY_AGAIN, logIn("alice")) << "the password was looked at";
             EXPECT_NE(std::string::npos, std::string(iscsi_host_last_error()).find(" seconds"));
@@ -209,12 +212,16 @@ TEST_F(SessionTest, FailedLogInsDelayTheNextOne)
 TEST_F(SessionTest, FailedLogInsToManyAccountsDelayTheAddress)
 {
     addAccount("alice");
+    time_t begin = 0;
     for (int i = 0; i < 16; ++i) {
         EXPECT_EQ(0, delay("alice", "2001:db8::1")) << i;
+        begin = time(nullptr);
         EXPECT_EQ(NORV_ERR_LOGIN, logIn("guess" + std::to_string(i), "wrong", "2001:db8::" + std::to_string(i)));
         age(i < 9 ? 0 : i < 15 ? 32 : 0);
     }
-    EXPECT_NEAR(64, delay("alice", "2001:db8::1"), 2);
+    const int64_t left = delay("alice", "2001:db8::1");
+    EXPECT_GE(65, left);
+    EXPECT_LE(64, left + 1 + time(nullptr) - begin);
     EXPECT_LT(0, delay("alice", "2001:0db8:0:0:ffff::1")) << "one user has all of a /64";
     EXPECT_EQ(0, delay("alice", "2001:db8:0:1::1"));
     age(64);
@@ -290,7 +297,7 @@ TEST_F(SessionTest, ManyLogInAndUseTheirSessionsAtOnce)
     ASSERT_EQ(1, read(begun[0], &byte, 1));
     const auto begin = std::chrono::steady_clock::now();
     EXPECT_EQ(0, use(shared));
-    EXPECT_GT(std::chrono::seconds(5), std::chrono::steady_clock::now() - begin) << "it waited for a busy state";
+    EXPECT_GT(std::chrono::seconds(25), std::chrono::steady_clock::now() - begin) << "it waited for a busy state";
     ASSERT_EQ(1, write(done[1], "", 1));
     EXPECT_EQ(0, waitForChild(writer));
     for (const int end : {begun[0], begun[1], done[0], done[1]})

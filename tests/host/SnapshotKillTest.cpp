@@ -154,12 +154,17 @@ TEST_F(SnapshotKillTest, RandomKills)
                 return 1;
         }
     };
+    int started[2];
+    ASSERT_EQ(0, pipe(started));
     std::mt19937 random(std::random_device{}());
     int interrupted = 0;
     for (int round = 0; round < 100 && !HasFailure(); ++round) {
         SCOPED_TRACE("round " + std::to_string(round));
         closeDatabase();
-        const pid_t worker = inChild(busy);
+        const pid_t worker =
+            inChild([&] { return openDatabase() == 0 && ::write(started[1], "", 1) == 1 ? busy() : 2; });
+        char byte;
+        ASSERT_EQ(1, ::read(started[0], &byte, 1));
         poll(nullptr, 0, static_cast<int>(random() % 60));
         kill(worker, SIGKILL);
         EXPECT_EQ(128 + SIGKILL, waitForChild(worker)) << "the worker failed before it was killed";
@@ -170,6 +175,8 @@ TEST_F(SnapshotKillTest, RandomKills)
         cleanUp();
     }
     EXPECT_LT(0, interrupted) << "no restore was ever cut short";
+    close(started[0]);
+    close(started[1]);
 }
 
 } // namespace

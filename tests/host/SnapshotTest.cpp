@@ -191,12 +191,14 @@ TEST_F(SnapshotTest, HoldsThePointInTimeAndRestoresIntoTheSameFile)
     _tag_iscsi_snapshot_ snapshot = {};
     snprintf(snapshot.name, sizeof snapshot.name, "daily");
     snapshot.flags = NORV_SNAPSHOT_SCHEDULED | NORV_SNAPSHOT_TRASH;
+    const time_t begin = time(nullptr);
     ASSERT_EQ(0, NORViSCSISnapshotCreate(&lun, &snapshot)) << iscsi_host_last_error();
     _tag_iscsi_snapshot_ upper = snapshot;
     for (char &c : upper.uuid)
         c = static_cast<char>(toupper(c));
     const _tag_iscsi_snapshot_ stored = reload(upper);
-    EXPECT_NEAR(static_cast<double>(time(nullptr)), stored.create_time, 5);
+    EXPECT_LE(begin, stored.create_time);
+    EXPECT_GE(time(nullptr), stored.create_time);
     EXPECT_EQ(static_cast<uint32_t>(NORV_SNAPSHOT_SCHEDULED), stored.flags) << "a new one is not in the trash";
     EXPECT_LE(64u * 4096, stored.mapped_size);
     EXPECT_GE(66u * 4096, stored.mapped_size) << "more than the data and the list of its extents";
@@ -211,7 +213,8 @@ TEST_F(SnapshotTest, HoldsThePointInTimeAndRestoresIntoTheSameFile)
     ASSERT_EQ(0, NORViSCSISnapshotRestore(&snapshot, &lun)) << iscsi_host_last_error();
     EXPECT_EQ(first, digest(path));
     EXPECT_EQ(inode, inodeOf(path)) << "a mapped LUN would be lost";
-    EXPECT_NEAR(static_cast<double>(time(nullptr)), reload(lun).restored_time, 5);
+    EXPECT_LE(begin, reload(lun).restored_time);
+    EXPECT_GE(time(nullptr), reload(lun).restored_time);
     ASSERT_EQ(0, NORViSCSISnapshotRestore(&later, &lun));
     EXPECT_EQ(second, digest(path));
     EXPECT_EQ(first, digest(snapshotDataPath(snapshot)));
@@ -508,7 +511,7 @@ TEST_F(SnapshotTest, OfTwoRestoresAtOnceTheSecondIsRefused)
     const _tag_iscsi_snapshot_ snapshot = take(lun, "s");
     const size_t before = digest(dataPath(lun));
     int done = 0, refused = 0;
-    for (int round = 0; round < 8; ++round) {
+    for (int round = 0; round < 8 || (refused == 0 && round < 400); ++round) { // until they have met
         write(dataPath(lun), 0, "changed");
         closeDatabase();
         std::vector<pid_t> children;
