@@ -3,17 +3,14 @@
 import glob
 import json
 import os
-import pty
 import pwd
 import re
 import shutil
 import signal
 import subprocess
-import sys
 import time
-import unittest
 
-from appliance import ISCSICTL, Appliance
+from appliance import ISCSICTL, Appliance, main_in_namespaces
 
 KEYS = {"snapshot_id", "parent_lun_id", "total_size", "mapped_size", "create_time", "snapshot_time", "is_app_consistent",
         "is_user_locked", "name", "status", "description", "root_path", "taken_by", "uuid", "version", "is_action_locked",
@@ -187,37 +184,30 @@ class Snapshots(Appliance):
         self.take("--name", "one")
         exported = os.path.join(self.folder, "exported")
         self.assertEqual(self.run_cli("snapshot", "export", "vm_one", exported, "--watch").returncode, 0)
-        pid, terminal = pty.fork()
-        if pid == 0:
-            os.execve(ISCSICTL, [ISCSICTL, "lun", "import", "vm", exported, "--watch"], self.env)
-        screen = b""
-        try:
-            while chunk := os.read(terminal, 4096):
-                screen += chunk
-        except OSError:  # the terminal's other end is closed
-            pass
-        os.close(terminal)
-        self.assertEqual(os.waitstatus_to_exitcode(os.waitpid(pid, 0)[1]), 0, screen)
-        self.assertRegex(screen.decode(), r"\[#{30}\] 100% of 12M")
-        self.assertTrue(screen.decode().endswith(f"\r\x1b[KImported {exported} into LUN vm\r\n"), screen)
+        status, screen = self.on_terminal("lun", "import", "vm", exported, "--watch")
+        self.assertEqual(status, 0, screen)
+        self.assertRegex(screen, r"\[#{30}\] 100% of 12M")
+        self.assertTrue(screen.endswith(f"\r\x1b[KImported {exported} into LUN vm\r\n"), screen)
 
     def test_retention(self):
         self.fails(2, "retention", "set", "vm", says="--keep")
         self.fails(1, "retention", "set", "vm", "--keep", "0", says=r"\(18990004\)")
         self.assertEqual(self.ok("retention", "show", "vm"), "Kept: all\n")
-        for name in ("a", "b", "c"):
+        for name in ("0", "a", "b", "c"):
             self.take("--name", name)
+        self.ok("snapshot", "lock", "vm_0", "--app-key", "backup")
         self.ok("snapshot", "lock", "vm_a")
         table = self.ok("retention", "dry-run", "vm", "--keep", "1")
-        self.assertRegex(table, r"^ID +NAME +TIME +VERDICT +REASON\n *3 +c .* stays +newest 1 of 1\n"
-                                r" *2 +b .* goes +no rule keeps it\n *1 +a .* stays +locked by the user\n$")
-        self.assertEqual(len(self.list("vm")), 3)
+        self.assertRegex(table, r"^ID +NAME +TIME +VERDICT +REASON\n *4 +c .* stays +newest 1 of 1\n"
+                                r" *3 +b .* goes +no rule keeps it\n *2 +a .* stays +locked by the user\n"
+                                r" *1 +0 .* stays +locked by backup\n$")
+        self.assertEqual(len(self.list("vm")), 4)
         self.assertEqual(self.ok("retention", "set", "vm", "--keep", "2", "--daily", "7"), "Kept: 2 newest, 7 daily\n")
         verdicts = json.loads(self.ok("retention", "dry-run", "vm", "--json"))
-        self.assertEqual([(v["name"], v["is_kept"]) for v in verdicts], [("c", True), ("b", True), ("a", True)])
+        self.assertEqual([(v["name"], v["is_kept"]) for v in verdicts], [("c", True), ("b", True), ("a", True), ("0", True)])
         # It runs after each snapshot.
         self.take("--name", "d")
-        self.wait_for("b to go", lambda: [s["name"] for s in self.list("vm")] == ["a", "c", "d"])
+        self.wait_for("b to go", lambda: [s["name"] for s in self.list("vm")] == ["0", "a", "c", "d"])
         self.ok("retention", "remove", "vm")
         self.assertEqual(json.loads(self.ok("retention", "show", "vm", "--json")),
                          {"newest": 0, "hourly": 0, "daily": 0, "weekly": 0})
@@ -279,14 +269,4 @@ class Snapshots(Appliance):
 
 
 if __name__ == "__main__":
-    if os.geteuid() != 0:
-        sys.exit("this test makes namespaces and mounts volumes: it needs root")
-    if sys.argv[-1:] == ["--inside"]:
-        # Progress files lie where every appliance of the machine has them.
-        os.makedirs("/tmp/iscsi", exist_ok=True)
-        subprocess.run(["mount", "-t", "tmpfs", "-o", "mode=0755", "tmpfs", "/tmp/iscsi"], check=True)
-        subprocess.run(["ip", "link", "set", "lo", "up"], check=True)
-        unittest.main(argv=sys.argv[:-1])
-    inside = ["unshare", "--mount", "--net", "--pid", "--fork", "--kill-child", "--mount-proc", sys.executable, *sys.argv,
-              "--inside"]
-    os.execvp(inside[0], inside)
+    main_in_namespaces()

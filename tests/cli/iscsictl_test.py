@@ -2,7 +2,6 @@
 
 import json
 import os
-import pty
 import subprocess
 import unicodedata
 import unittest
@@ -175,34 +174,17 @@ class Words(Appliance):
 
 
 class Terminal(Appliance):
-    def talk(self, *args, answers):
-        """Runs iscsictl on a terminal and answers each of its questions; returns its status and all of the screen."""
-        pid, terminal = pty.fork()
-        if pid == 0:
-            os.execve(ISCSICTL, [ISCSICTL, *args], self.env)
-        screen = b""
-        answers = list(answers)
-        try:
-            while chunk := os.read(terminal, 4096):
-                screen += chunk
-                if answers and screen.endswith((b"] ", b": ")):
-                    os.write(terminal, answers.pop(0).encode() + b"\n")
-        except OSError:  # the terminal's other end is closed
-            pass
-        os.close(terminal)
-        return os.waitstatus_to_exitcode(os.waitpid(pid, 0)[1]), screen.decode()
-
     def test_deleting_asks(self):
         self.create("x")
-        status, screen = self.talk("lun", "delete", "x", answers=["n"])
+        status, screen = self.on_terminal("lun", "delete", "x", answers=["n"])
         self.assertEqual((status, len(self.luns())), (0, 1))
         self.assertIn("Delete LUN x (16M) and all its data? [y/N]", screen)
-        self.assertEqual(self.talk("lun", "delete", "lun#1", answers=["y"])[0], 0)
+        self.assertEqual(self.on_terminal("lun", "delete", "lun#1", answers=["y"])[0], 0)
         self.assertEqual(self.luns(), [])
 
     def test_secrets_are_asked_for_and_never_shown(self):
         secret = "s3cret-of-16-byte"
-        status, screen = self.talk("target", "create", "t", "--chap-user", "u", answers=[secret, secret + "x"])
+        status, screen = self.on_terminal("target", "create", "t", "--chap-user", "u", answers=[secret, secret + "x"])
         self.assertEqual(status, 1)
         self.assertIn("CHAP secret, again: ", screen)
         self.assertIn("differ", screen)

@@ -85,17 +85,6 @@ TEST(Answer, ToUnknownPathsAndMethods)
     EXPECT_EQ(ask("BREW", "/api/v1/luns").status, 501);
 }
 
-TEST(Answer, IsAProblemWithoutASession)
-{
-    const HttpAnswer answer = ask("GET", "/api/v1/luns?status=true");
-    EXPECT_EQ(answer.status, 401);
-    EXPECT_EQ(answer.body["code"], ISCSI::ERR_FAILED_TO_LOGIN);
-    const std::string text = webapi::cgiText(answer);
-    EXPECT_EQ(text.rfind("Status: 401\r\nWWW-Authenticate: Bearer\r\nContent-Type: application/problem+json\r\n", 0),
-              0u)
-        << text;
-}
-
 TEST(Answer, KeepsTextsOutOfHeaders)
 {
     HttpAnswer answer = webapi::problem(422, ISCSI::ERR_BAD_LUN_NAME, "a\r\nSet-Cookie: x=1\r\n\r\n\xff");

@@ -8,11 +8,10 @@ import socket
 import sqlite3
 import ssl
 import subprocess
-import sys
 import threading
 import time
-import unittest
 
+from appliance import main_in_namespaces
 from client import ADDRESS, PASSWORD, ROOT, Served
 
 CALLS = 10000 if os.environ.get("ISCSIWEBAPI_LONG") else 2000
@@ -103,12 +102,13 @@ class WebApi(Served):
         for method, path, operation in self.routes(description):
             target = ROOT + path.replace("{lun}", "vm").replace("{", "").replace("}", "")
             for who in (stranger, ended):
-                status, _, text = who.raw(method, target)
+                status, headers, text = who.raw(method, target)
                 if operation["x-role"] == "anyone":
                     open_routes.add((method, path))
                     self.assertIn(status, (200, 400))
                 else:
                     self.assertEqual((status, json.loads(text)["code"]), (401, 18990205), target)
+                    self.assertEqual(headers["WWW-Authenticate"], "Bearer")
             if operation["x-role"] == "admin":
                 self.assertEqual(viewer.raw(method, target)[0], 403, target)
         self.assertEqual(open_routes, {("GET", "/health"), ("POST", "/session")})
@@ -402,10 +402,4 @@ class WebApi(Served):
 
 
 if __name__ == "__main__":
-    if os.geteuid() != 0:
-        sys.exit("this test makes namespaces and runs daemons: it needs root")
-    if sys.argv[-1:] == ["--inside"]:
-        subprocess.run(["ip", "link", "set", "lo", "up"], check=True)
-        unittest.main(argv=sys.argv[:-1])
-    inside = ["unshare", "--net", "--pid", "--fork", "--kill-child", "--mount-proc", sys.executable, *sys.argv, "--inside"]
-    os.execvp(inside[0], inside)
+    main_in_namespaces()
