@@ -50,23 +50,6 @@ fs::path fileOf(const Address &appliance)
     throw Failure{code, file.string() + ": " + strerror(errno)};
 }
 
-const char *nameOf(Method method)
-{
-    switch (method) {
-    case Method::Get:
-        return "GET";
-    case Method::Post:
-        return "POST";
-    case Method::Put:
-        return "PUT";
-    case Method::Patch:
-        return "PATCH";
-    case Method::Delete:
-        return "DELETE";
-    }
-    return "";
-}
-
 std::string query(const Json::Value &input)
 {
     std::string text;
@@ -159,7 +142,7 @@ Result Remote::dispatch(Method method, const std::string &path, const Json::Valu
     request.host = appliance.host;
     request.port = appliance.port;
     request.protocol = "https";
-    request.method = nameOf(method);
+    request.method = webapi::methodName(method);
     request.path = ROOT + path;
     if (method == Method::Get)
         request.path += query(input);

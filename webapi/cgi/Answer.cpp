@@ -21,16 +21,6 @@ constexpr std::string_view ROOT = "/api/v1";
 constexpr std::string_view BEARER = "Bearer ";
 constexpr std::string_view JSON_TYPE = "application/json";
 
-struct MethodName {
-    Method method;
-    const char *name;
-};
-
-constexpr MethodName METHODS[] = {
-    {Method::Get, "GET"},     {Method::Post, "POST"},     {Method::Put, "PUT"},
-    {Method::Patch, "PATCH"}, {Method::Delete, "DELETE"},
-};
-
 std::optional<Method> methodOf(const std::string &name)
 {
     for (const MethodName &entry : METHODS) {

@@ -2,7 +2,9 @@
 
 #include "iscsiwebapi/ISCSIErrorCode.h"
 
+#include <algorithm>
 #include <cctype>
+#include <iterator>
 #include <new>
 
 namespace webapi {
@@ -50,6 +52,13 @@ bool match(const std::string &pattern, const std::vector<std::string> &path, std
 }
 
 } // namespace
+
+const char *methodName(Method method)
+{
+    return std::find_if(std::begin(METHODS), std::end(METHODS),
+                        [&](const MethodName &entry) { return entry.method == method; })
+        ->name;
+}
 
 Found findRoute(Method method, const std::string &path)
 {

@@ -21,6 +21,17 @@ enum class Method {
     Delete
 };
 
+/// As on the wire.
+struct MethodName {
+    Method method;
+    const char *name;
+};
+constexpr MethodName METHODS[] = {
+    {Method::Get, "GET"},     {Method::Post, "POST"},     {Method::Put, "PUT"},
+    {Method::Patch, "PATCH"}, {Method::Delete, "DELETE"},
+};
+const char *methodName(Method method);
+
 /// Who may ask: a viewer reads, an administrator does everything. Anyone needs no session.
 enum class Role {
     Anyone,

@@ -25,23 +25,6 @@ Json::Value texts()
     return value;
 }
 
-const char *methodName(Method method)
-{
-    switch (method) {
-    case Method::Get:
-        return "GET";
-    case Method::Post:
-        return "POST";
-    case Method::Put:
-        return "PUT";
-    case Method::Patch:
-        return "PATCH";
-    case Method::Delete:
-        break;
-    }
-    return "DELETE";
-}
-
 std::string lowerCase(std::string text)
 {
     for (char &c : text)
