@@ -20,18 +20,6 @@ using namespace norvhost;
 
 namespace {
 
-bool isUuid(const char (&field)[37])
-{
-    if (strnlen(field, sizeof field) != 36)
-        return false;
-    for (size_t i = 0; i < 36; ++i) {
-        const bool hyphen = i == 8 || i == 13 || i == 18 || i == 23;
-        if (hyphen ? field[i] != '-' : !strchr("0123456789abcdefABCDEF", field[i]))
-            return false;
-    }
-    return true;
-}
-
 /// A copy of the caller's task whose texts are good, with UUIDs in lower case.
 int checkTask(const _tag_iscsi_task_ *task, _tag_iscsi_task_ &out)
 {
@@ -39,15 +27,15 @@ int checkTask(const _tag_iscsi_task_ *task, _tag_iscsi_task_ &out)
         return fail(NORV_ERR_NULL_POINTER, "no task record");
     out = *task;
     out.forward = out.backward = nullptr;
-    if (!out.is_source && !isUuid(out.uuid))
+    if (!out.is_source && !isUuid(fieldText(out.uuid)))
         return fail(NORV_ERR_TASK_UUID, "uuid: a destination task takes the UUID of its source task");
-    if (!isUuid(out.src_lun_uuid))
+    if (!isUuid(fieldText(out.src_lun_uuid)))
         return fail(NORV_ERR_TASK_SOURCE_LUN, "src_lun_uuid: is no UUID");
-    if (!isUuid(out.dst_lun_uuid))
+    if (!isUuid(fieldText(out.dst_lun_uuid)))
         return fail(NORV_ERR_TASK_LUN, "dst_lun_uuid: is no UUID");
-    if (!isUuid(out.src_node_uuid))
+    if (!isUuid(fieldText(out.src_node_uuid)))
         return fail(NORV_ERR_TASK_SOURCE_NODE, "src_node_uuid: is no UUID");
-    if (!isUuid(out.dst_node_uuid))
+    if (!isUuid(fieldText(out.dst_node_uuid)))
         return fail(NORV_ERR_TASK_NODE, "dst_node_uuid: is no UUID");
     if (!memchr(out.root_path, '\0', sizeof out.root_path) ||
         !memchr(out.parent_task_uuid, '\0', sizeof out.parent_task_uuid))
@@ -75,7 +63,7 @@ int loadCallersTask(const _tag_iscsi_task_ *task, TaskRow &row)
 {
     if (!task)
         return fail(NORV_ERR_NULL_POINTER, "no task record");
-    return loadTask(std::string(task->uuid, strnlen(task->uuid, sizeof task->uuid)), row);
+    return loadTask(fieldText(task->uuid), row);
 }
 
 } // namespace

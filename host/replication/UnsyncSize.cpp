@@ -20,8 +20,7 @@ namespace {
 int openByUuid(const _tag_iscsi_snapshot_ &snapshot, FileDescriptor &file, uint64_t &size)
 {
     SnapshotRow row;
-    if (int err =
-            loadSnapshotByUuid(std::string_view(snapshot.uuid, strnlen(snapshot.uuid, sizeof snapshot.uuid)), row))
+    if (int err = loadSnapshotByUuid(fieldText(snapshot.uuid), row))
         return err;
     size = row.record.total_size;
     return openSnapshotData(row.record, file);
@@ -55,7 +54,7 @@ int NORViSCSIReplicationTaskUnsyncSizeComputeStart(const _tag_iscsi_task_ *task,
     }
     if (int err = openByUuid(*snapshot, file, size))
         return err;
-    const std::string uuid = lowerCase(std::string_view(task->uuid, strnlen(task->uuid, sizeof task->uuid)));
+    const std::string uuid = lowerCase(fieldText(task->uuid));
     NamedLock lock;
     if (int err = lock.tryTake(lockName(uuid.c_str())))
         return err;
@@ -82,7 +81,7 @@ int NORViSCSIReplicationTaskUnsyncSizeGet(const _tag_iscsi_task_ *task, uint64_t
 {
     if (!task || !size || !completed)
         return fail(NORV_ERR_NULL_POINTER, "an argument is missing");
-    const std::string uuid = lowerCase(std::string_view(task->uuid, strnlen(task->uuid, sizeof task->uuid)));
+    const std::string uuid = lowerCase(fieldText(task->uuid));
     UnsyncCount count;
     bool counting = false;
     if (int err = readCount(uuid, count, counting))

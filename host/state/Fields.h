@@ -17,6 +17,13 @@ void copyText(char (&field)[size], std::string_view text)
     field[length] = '\0';
 }
 
+/// What a field of fixed width holds, which may be full to its last byte.
+template <size_t size>
+std::string_view fieldText(const char (&field)[size])
+{
+    return {field, strnlen(field, size)};
+}
+
 /// With ASCII letters in lower case, as the state has UUIDs.
 inline std::string lowerCase(std::string_view text)
 {

@@ -2,6 +2,7 @@
 
 #include "host/core/KeyValueFile.h"
 #include "host/core/LastError.h"
+#include "host/state/Fields.h"
 #include "host/storage/DataFile.h"
 #include "host/storage/LunChecks.h"
 #include "host/storage/MapFile.h"
@@ -30,7 +31,6 @@ constexpr const char *all_names[] = {record_name, unnamed_record, facts_name, da
 
 constexpr const char *format_key = "format";
 constexpr const char *format = "1";
-constexpr size_t uuid_length = 36;
 
 /// The path without links, of something that need not be there yet.
 int resolve(const std::string &path, std::string &canonical)
@@ -133,16 +133,6 @@ int readFile(const FileDescriptor &folder, const char *name, void *data, size_t 
     return 0;
 }
 
-bool isUuid(const char *text)
-{
-    for (size_t i = 0; i < uuid_length; ++i) {
-        const bool dash = i == 8 || i == 13 || i == 18 || i == 23;
-        if (dash ? text[i] != '-' : !text[i] || !strchr("0123456789abcdefABCDEF", text[i]))
-            return false;
-    }
-    return true;
-}
-
 template <size_t size>
 bool ends(const char (&text)[size])
 {
@@ -154,8 +144,8 @@ int readRecord(const FileDescriptor &folder, _tag_iscsi_export_config_ &config)
     _tag_iscsi_export_config_ read = {};
     if (int err = readFile(folder, record_name, &read, sizeof read))
         return err;
-    if (!isUuid(read.reserved_0) || !ends(read.desc) || !ends(read.taken_by) || read.app_consistent > 1 ||
-        read.user_locked > 1)
+    if (!isUuid({read.reserved_0, sizeof read.reserved_0}) || !ends(read.desc) || !ends(read.taken_by) ||
+        read.app_consistent > 1 || read.user_locked > 1)
         return fail(NORV_ERR_BAD_FILE_TYPE, "%s is no record of an export", record_name);
     config = read;
     return 0;

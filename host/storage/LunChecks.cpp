@@ -1,6 +1,7 @@
 #include "host/storage/LunChecks.h"
 
 #include "host/core/LastError.h"
+#include "host/state/Fields.h"
 #include "host/storage/DataFile.h"
 #include "host/storage/MapFile.h"
 #include "host/storage/Volumes.h"
@@ -55,18 +56,6 @@ bool takeCodePoint(std::string_view &text, uint32_t &code_point)
     text.remove_prefix(length);
     const bool overlong = (length == 3 && code_point < 0x800) || (length == 4 && code_point < 0x10000);
     return !overlong && code_point <= 0x10ffff;
-}
-
-bool looksLikeUuid(std::string_view name)
-{
-    if (name.size() != 36)
-        return false;
-    for (size_t i = 0; i < name.size(); ++i) {
-        const bool dash = i == 8 || i == 13 || i == 18 || i == 23;
-        if (dash ? name[i] != '-' : !strchr("0123456789abcdefABCDEF", name[i]))
-            return false;
-    }
-    return true;
 }
 
 bool isKnownType(int type)
@@ -129,7 +118,7 @@ int checkName(int code, std::string_view name)
         return fail(code, "the name is a folder's");
     if (name.front() == ' ' || name.back() == ' ')
         return fail(code, "the name begins or ends with a space");
-    if (looksLikeUuid(name))
+    if (isUuid(name))
         return fail(code, "the name looks like a UUID");
     for (std::string_view rest = name; !rest.empty();) {
         if (static_cast<unsigned char>(rest[0]) < 0x80) {
