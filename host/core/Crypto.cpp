@@ -90,6 +90,11 @@ std::string toBase64(std::string_view bytes)
     return text;
 }
 
+std::string pinOfKey(std::string_view der)
+{
+    return std::string(pin_prefix) + toBase64(sha256(der));
+}
+
 std::string toBase64Url(std::string_view bytes)
 {
     base64_encode_ctx context;

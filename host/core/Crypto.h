@@ -25,6 +25,10 @@ std::string toHex(std::string_view bytes);
 /// RFC 4648, with padding.
 std::string toBase64(std::string_view bytes);
 
+/// The SHA-256 of a public key (DER, SubjectPublicKeyInfo) as peers pin it: the prefix and base64.
+std::string pinOfKey(std::string_view der);
+inline constexpr std::string_view pin_prefix = "sha256//";
+
 /// What a text in base64 stands for, line breaks skipped; empty for what is none.
 std::string fromBase64(std::string_view text);
 

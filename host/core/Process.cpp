@@ -38,15 +38,6 @@ std::vector<std::string> mergedEnvironment(const std::vector<std::string> &chang
     return merged;
 }
 
-std::vector<char *> pointers(std::vector<std::string> &texts)
-{
-    std::vector<char *> result;
-    for (std::string &text : texts)
-        result.push_back(text.data());
-    result.push_back(nullptr);
-    return result;
-}
-
 struct Pipe {
     FileDescriptor read_end, write_end;
 
@@ -72,19 +63,9 @@ int spawn(const ProgramRun &run, const Pipe &output, const Pipe &errors, pid_t &
     posix_spawn_file_actions_adddup2(&actions, output.write_end.get(), STDOUT_FILENO);
     posix_spawn_file_actions_adddup2(&actions, errors.write_end.get(), STDERR_FILENO);
 
-    // The program starts with the default signals, whatever we ignore or block ourselves.
-    posix_spawnattr_t attributes;
-    posix_spawnattr_init(&attributes);
-    sigset_t signals;
-    sigfillset(&signals);
-    posix_spawnattr_setsigdefault(&attributes, &signals);
-    sigemptyset(&signals);
-    posix_spawnattr_setsigmask(&attributes, &signals);
-    posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGDEF | POSIX_SPAWN_SETSIGMASK);
-
-    const int errnum = posix_spawnp(&pid, arguments[0].c_str(), &actions, &attributes, pointers(arguments).data(),
+    const SpawnAttributes attributes;
+    const int errnum = posix_spawnp(&pid, arguments[0].c_str(), &actions, attributes.get(), pointers(arguments).data(),
                                     pointers(environment).data());
-    posix_spawnattr_destroy(&attributes);
     posix_spawn_file_actions_destroy(&actions);
     return errnum;
 }
@@ -124,6 +105,26 @@ bool readOutputs(const ProgramRun &run, Pipe &output, Pipe &errors, ProgramResul
 }
 
 } // namespace
+
+SpawnAttributes::SpawnAttributes(int flags)
+{
+    sigset_t all, none;
+    sigfillset(&all);
+    sigemptyset(&none);
+    posix_spawnattr_init(&attributes);
+    posix_spawnattr_setsigdefault(&attributes, &all);
+    posix_spawnattr_setsigmask(&attributes, &none);
+    posix_spawnattr_setflags(&attributes, static_cast<short>(flags | POSIX_SPAWN_SETSIGDEF | POSIX_SPAWN_SETSIGMASK));
+}
+
+std::vector<char *> pointers(std::vector<std::string> &texts)
+{
+    std::vector<char *> result;
+    for (std::string &text : texts)
+        result.push_back(text.data());
+    result.push_back(nullptr);
+    return result;
+}
 
 int runProgram(const ProgramRun &run, ProgramResult &result)
 {

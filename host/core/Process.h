@@ -2,6 +2,7 @@
 #pragma once
 
 #include <cstddef>
+#include <spawn.h>
 #include <string>
 #include <vector>
 
@@ -23,6 +24,23 @@ struct ProgramResult {
 /// Runs a program with no input and waits for it. 0 when it ran, whatever its exit status; else
 /// NORV_ERR_FILE_NOT_FOUND (no such program), NORV_ERR_TIMEOUT or another error code.
 int runProgram(const ProgramRun &run, ProgramResult &result);
+
+/// Attributes of a new process: whatever we ignore or block ourselves, it starts with the default signals.
+class SpawnAttributes {
+public:
+    /// `flags` as of posix_spawnattr_setflags(), beside those of the signals.
+    explicit SpawnAttributes(int flags = 0);
+    SpawnAttributes(const SpawnAttributes &) = delete;
+    ~SpawnAttributes() { posix_spawnattr_destroy(&attributes); }
+
+    const posix_spawnattr_t *get() const { return &attributes; }
+
+private:
+    posix_spawnattr_t attributes;
+};
+
+/// An argument vector or an environment of texts, which must stay.
+std::vector<char *> pointers(std::vector<std::string> &texts);
 
 /// The last line of a program's messages, for a reason.
 std::string lastLine(const std::string &text);

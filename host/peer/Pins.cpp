@@ -14,7 +14,6 @@
 namespace norvhost {
 namespace {
 
-constexpr std::string_view pin_prefix = "sha256//";
 constexpr size_t digest_base64_size = 44;
 constexpr const char *base64_alphabet = "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789+/";
 
@@ -53,7 +52,7 @@ int pinOfCertificate(const std::string &pem, const std::string &origin, std::str
     const std::string key = certificate ? publicKey(*crypto, certificate.get()) : std::string();
     if (key.empty())
         return fail(NORV_ERR_BAD_PARAMETER, "%s: no certificate that can be read", origin.c_str());
-    pin = std::string(pin_prefix) + toBase64(sha256(key));
+    pin = pinOfKey(key);
     return 0;
 }
 

@@ -148,6 +148,22 @@ int storeSynchronised(int fd, const std::string &path, StoredVersions &stored)
     return writeStored(fd, path, stored);
 }
 
+/// `change` stores what it changes.
+template <class Change>
+int changeStored(const std::string &path, Change change)
+{
+    FileDescriptor file;
+    struct stat status;
+    StoredVersions stored;
+    if (int err = openMapFile(path, file, status))
+        return err;
+    if (int err = readStored(file.get(), path, stored))
+        return err;
+    if (int err = change(file, stored))
+        return err;
+    return flush(file, path);
+}
+
 } // namespace
 
 int readVersions(const std::string &path, Versions &versions)
@@ -161,50 +177,28 @@ int readVersions(const std::string &path, Versions &versions)
 
 int beginSynchronisation(const std::string &path, const std::string &incoming)
 {
-    FileDescriptor file;
-    struct stat status;
-    StoredVersions stored;
-    if (int err = openMapFile(path, file, status))
-        return err;
-    if (int err = readStored(file.get(), path, stored))
-        return err;
-    snprintf(stored.current, sizeof stored.current, "%s", incoming.c_str());
-    if (int err = writeStored(file.get(), path, stored))
-        return err;
-    return flush(file, path);
+    return changeStored(path, [&](const FileDescriptor &file, StoredVersions &stored) {
+        snprintf(stored.current, sizeof stored.current, "%s", incoming.c_str());
+        return writeStored(file.get(), path, stored);
+    });
 }
 
 int forgetBase(const std::string &path)
 {
-    FileDescriptor file;
-    struct stat status;
-    StoredVersions stored;
-    if (int err = openMapFile(path, file, status))
-        return err;
-    if (int err = readStored(file.get(), path, stored))
-        return err;
-    snprintf(stored.base, sizeof stored.base, "%s", NORV_ZERO_UUID);
-    if (int err = writeStored(file.get(), path, stored))
-        return err;
-    return flush(file, path);
+    return changeStored(path, [&](const FileDescriptor &file, StoredVersions &stored) {
+        snprintf(stored.base, sizeof stored.base, "%s", NORV_ZERO_UUID);
+        return writeStored(file.get(), path, stored);
+    });
 }
 
 int finishSynchronisation(const std::string &path)
 {
-    FileDescriptor file;
-    struct stat status;
-    StoredVersions stored;
-    if (int err = openMapFile(path, file, status))
-        return err;
-    if (int err = readStored(file.get(), path, stored))
-        return err;
-    if (int err = flush(file, path))
-        return err;
-
-    snprintf(stored.base, sizeof stored.base, "%s", stored.current);
-    if (int err = storeSynchronised(file.get(), path, stored))
-        return err;
-    return flush(file, path);
+    return changeStored(path, [&](const FileDescriptor &file, StoredVersions &stored) {
+        if (int err = flush(file, path))
+            return err;
+        snprintf(stored.base, sizeof stored.base, "%s", stored.current);
+        return storeSynchronised(file.get(), path, stored);
+    });
 }
 
 int copyVersions(int from, int to, bool quiet)

@@ -199,7 +199,7 @@ int getWebCertificate(WebCertificate &certificate)
     found.subject = valueOf(text, "subject=");
     found.ends = valueOf(text, "notAfter=");
     found.names = valueOf(text, "Subject Alternative Name:");
-    found.pin = "sha256//" + toBase64(sha256(fromPem(key)));
+    found.pin = pinOfKey(fromPem(key));
     certificate = found;
     return 0;
 }
