@@ -18,10 +18,9 @@ namespace {
 using Keys = std::vector<std::pair<std::string, std::string>>;
 using Hash = std::unique_ptr<NLIBC_SZ_HASH, decltype(&NLIBCSzHashFree)>;
 
-class FileContract : public testing::Test {
+class FileContract : public testing::Test, protected Platform {
 protected:
-    Platform platform;
-    const std::string path = platform.folder + "/node.conf", lock = platform.folder + "/node.lock";
+    const std::string path = folder + "/node.conf", lock = folder + "/node.lock";
 
     static Hash hashOf(const Keys &keys)
     {

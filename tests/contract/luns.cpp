@@ -16,30 +16,8 @@
 namespace contract {
 namespace {
 
-constexpr uint64_t MIB = 1 << 20;
-const char *const NO_UUID = "ffffffff-ffff-4fff-bfff-ffffffffffff";
-
-class LUNContract : public testing::Test {
+class LUNContract : public testing::Test, protected Platform {
 protected:
-    Platform platform;
-
-    _tag_iscsi_lun_ request(const std::string &name, int type = NORV_LUN_TYPE_ADV, uint64_t size = 4 * MIB)
-    {
-        _tag_iscsi_lun_ lun{};
-        lun.type = type;
-        lun.size = size;
-        set(lun.name, name);
-        set(lun.location, platform.volume);
-        return lun;
-    }
-
-    _tag_iscsi_lun_ create(const std::string &name, int type = NORV_LUN_TYPE_ADV)
-    {
-        _tag_iscsi_lun_ lun = request(name, type);
-        EXPECT_EQ(NORViSCSILunCreate(&lun), 0) << name;
-        return lun;
-    }
-
     static _tag_iscsi_lun_ byUUID(const char *uuid)
     {
         _tag_iscsi_lun_ lun{};
@@ -64,7 +42,7 @@ protected:
 
     std::string mapFile(const _tag_iscsi_lun_ &lun, const char *folder = "@iSCSITrg") const
     {
-        return platform.volume + "/" + folder + "/iSCSI_" + std::to_string(lun.lid) + "_Extent_" + lun.name + "_000";
+        return volume + "/" + folder + "/iSCSI_" + std::to_string(lun.lid) + "_Extent_" + lun.name + "_000";
     }
 };
 
@@ -73,7 +51,7 @@ TEST_F(LUNContract, ACreatedLUNIsFoundInEveryWay)
     EXPECT_TRUE(names().empty());
     for (int type : {NORV_LUN_TYPE_FILE, NORV_LUN_TYPE_THIN, NORV_LUN_TYPE_ADV, NORV_LUN_TYPE_SINK}) {
         const std::string name = "kind " + std::to_string(type);
-        const auto created = create(name, type);
+        const auto created = createLUN(name, type);
         EXPECT_GE(created.lid, 1);
         EXPECT_LE(created.lid, NORV_LUN_ID_MAX);
         EXPECT_EQ(strlen(created.uuid), 36u);
@@ -86,7 +64,7 @@ TEST_F(LUNContract, ACreatedLUNIsFoundInEveryWay)
             EXPECT_EQ(lun.size, 4 * MIB);
             EXPECT_EQ(lun.options, 0u);
             EXPECT_EQ(lun.restored_time, 0);
-            EXPECT_EQ(lun.location, platform.volume);
+            EXPECT_EQ(lun.location, volume);
         }
     }
     EXPECT_EQ(names().size(), 4u);
@@ -94,7 +72,7 @@ TEST_F(LUNContract, ACreatedLUNIsFoundInEveryWay)
 
 TEST_F(LUNContract, BadRequestsLeaveNothing)
 {
-    create("taken");
+    createLUN("taken");
     const struct {
         int err;
         _tag_iscsi_lun_ lun;
@@ -120,7 +98,7 @@ TEST_F(LUNContract, BadRequestsLeaveNothing)
 
 TEST_F(LUNContract, WhatDoesNotExistIsSaid)
 {
-    create("other");
+    createLUN("other");
     _tag_iscsi_lun_ lun{};
     EXPECT_EQ(NORViSCSILunConfigGetByUUID(NO_UUID, &lun, 0), NORV_ERR_NO_SUCH_LUN);
     EXPECT_EQ(NORViSCSILunGetByLunId(1000, &lun), NORV_ERR_NO_SUCH_LUN);
@@ -139,7 +117,7 @@ TEST_F(LUNContract, WhatDoesNotExistIsSaid)
 
 TEST_F(LUNContract, NamesAreComparedByteWise)
 {
-    create("Name");
+    createLUN("Name");
     bool exists = false;
     EXPECT_EQ(NORViSCSILunIsNameExist("Name", &exists), 0);
     EXPECT_TRUE(exists);
@@ -148,13 +126,13 @@ TEST_F(LUNContract, NamesAreComparedByteWise)
         EXPECT_EQ(NORViSCSILunIsNameExist(name, &exists), 0);
         EXPECT_FALSE(exists) << name;
     }
-    create("name");
+    createLUN("name");
 }
 
 TEST_F(LUNContract, UpdateRenamesAndGrows)
 {
-    const auto created = create("before");
-    create("taken");
+    const auto created = createLUN("before");
+    createLUN("taken");
     auto lun = created;
     EXPECT_EQ(NORViSCSILunUpdate(&lun), 0) << "nothing to change is no failure";
     set(lun.name, "after");
@@ -176,18 +154,20 @@ TEST_F(LUNContract, UpdateRenamesAndGrows)
 
 TEST_F(LUNContract, ADeletedLUNIsGone)
 {
-    auto lun = create("n");
-    create("stays");
+    auto lun = createLUN("n");
+    createLUN("stays");
     EXPECT_EQ(NORViSCSILunDelete(&lun), 0);
     EXPECT_EQ(names(), std::vector<std::string>{"stays"});
-    EXPECT_EQ(NORViSCSILunDelete(&lun), NORV_ERR_NO_SUCH_LUN);
-    const auto again = create("n");
+    const auto again = createLUN("n");
+    EXPECT_EQ(again.lid, lun.lid);
     EXPECT_STRNE(again.uuid, lun.uuid);
+    EXPECT_EQ(NORViSCSILunDelete(&lun), NORV_ERR_NO_SUCH_LUN) << "an old record hits the next LUN";
+    EXPECT_EQ(names().size(), 2u);
 }
 
 TEST_F(LUNContract, AnIdleLUNIsUnlockedAndHealthy)
 {
-    const auto lun = create("n");
+    const auto lun = createLUN("n");
     bool is_locked = true;
     EXPECT_EQ(NORViSCSILunIsLocked(&lun, &is_locked), 0);
     EXPECT_FALSE(is_locked);
@@ -202,7 +182,7 @@ TEST_F(LUNContract, AnIdleLUNIsUnlockedAndHealthy)
 
 TEST_F(LUNContract, AMapFileAnswersByItsPath)
 {
-    auto lun = create("n");
+    auto lun = createLUN("n");
     const auto answers = [&](const std::string &path) {
         char version[37] = "";
         _tag_map_file_version_ info{};
@@ -237,11 +217,11 @@ TEST_F(LUNContract, AMapFileAnswersByItsPath)
 
 TEST_F(LUNContract, JobsAndPoliciesAreFoundAndRemoved)
 {
-    const auto lun = create("n");
+    const auto lun = createLUN("n");
     EXPECT_EQ(NORViSCSILunTaskGetSchIDByName("n"), -1);
     EXPECT_EQ(ScheduleSnapshotTaskGetIDByLid(lun.lid), -1);
-    platform.addSnapshotTask(lun.lid, "n");
-    platform.addScheduledSnapshots(lun.lid);
+    addSnapshotTask(lun.lid, "n");
+    addScheduledSnapshots(lun.lid);
     const long task = NORViSCSILunTaskGetSchIDByName("n");
     const long schedule = ScheduleSnapshotTaskGetIDByLid(lun.lid);
     EXPECT_NE(task, -1);
@@ -252,7 +232,7 @@ TEST_F(LUNContract, JobsAndPoliciesAreFoundAndRemoved)
     EXPECT_EQ(ScheduleSnapshotTaskGetIDByLid(lun.lid), schedule);
     EXPECT_LT(NORVSchedTaskRemove(task), 0);
 
-    platform.addRetentionPolicy(lun.lid);
+    addRetentionPolicy(lun.lid);
     const std::string key = std::to_string(lun.lid);
     EXPECT_EQ(NORVRETENTIONRemovePolicy("Lun#", key.c_str()), 0);
     EXPECT_EQ(NORVRETENTIONRemovePolicy("Lun#", key.c_str()), 0) << "none is no failure";

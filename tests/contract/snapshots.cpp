@@ -14,31 +14,16 @@
 namespace contract {
 namespace {
 
-constexpr uint64_t MIB = 1 << 20;
-const char *const NO_UUID = "ffffffff-ffff-4fff-bfff-ffffffffffff";
-
-class SnapshotContract : public testing::Test {
+class SnapshotContract : public testing::Test, protected Platform {
 protected:
-    Platform platform;
     _tag_iscsi_lun_ lun = createLUN("lun");
 
     ~SnapshotContract() override
     {
         for (auto &snapshot : list()) {
-            platform.unlock(snapshot.uuid);
+            unlock(snapshot.uuid);
             EXPECT_EQ(NORViSCSISnapshotDelete(&snapshot, "the test"), 0) << snapshot.name;
         }
-    }
-
-    _tag_iscsi_lun_ createLUN(const std::string &name, int type = NORV_LUN_TYPE_ADV)
-    {
-        _tag_iscsi_lun_ made{};
-        made.type = type;
-        made.size = 4 * MIB;
-        set(made.name, name);
-        set(made.location, platform.volume);
-        EXPECT_EQ(NORViSCSILunCreate(&made), 0) << name;
-        return made;
     }
 
     static int tryTake(const _tag_iscsi_lun_ &of, const std::string &name, _tag_iscsi_snapshot_ &made, int32_t time = 0)
@@ -121,7 +106,7 @@ TEST_F(SnapshotContract, ATakenSnapshotIsFoundInEveryWay)
         EXPECT_STREQ(snapshot.status, "Healthy");
         EXPECT_STREQ(snapshot.desc, "the note");
         EXPECT_STREQ(snapshot.taken_by, "the test");
-        EXPECT_EQ(snapshot.root_path, platform.volume);
+        EXPECT_EQ(snapshot.root_path, volume);
         EXPECT_STREQ(snapshot.uuid, made.uuid);
         EXPECT_STREQ(snapshot.version, made.version);
     }
@@ -186,7 +171,7 @@ TEST_F(SnapshotContract, BadRequestsLeaveNothing)
     EXPECT_EQ(NORViSCSISnapshotRestore(&gone, &lun), NORV_ERR_NO_SUCH_SNAPSHOT);
     EXPECT_EQ(NORViSCSISnapshotLoad(&gone), NORV_ERR_NO_SUCH_SNAPSHOT);
     EXPECT_EQ(NORViSCSISnapshotUnload(&gone), NORV_ERR_NO_SUCH_SNAPSHOT);
-    EXPECT_EQ(NORViSCSISnapshotExport(&gone, (platform.volume + "/export").c_str()), NORV_ERR_NO_SUCH_SNAPSHOT);
+    EXPECT_EQ(NORViSCSISnapshotExport(&gone, (volume + "/export").c_str()), NORV_ERR_NO_SUCH_SNAPSHOT);
     auto clone = lun;
     set(clone.name, "clone");
     EXPECT_EQ(NORViSCSISnapshotClone(&gone, &clone), NORV_ERR_NO_SUCH_SNAPSHOT);
@@ -282,7 +267,7 @@ TEST_F(SnapshotContract, RestoreAndClonesAreOfTheSnapshotsLUN)
 TEST_F(SnapshotContract, AnExportTellsOfItsSnapshotAndIsImportedOnce)
 {
     const auto snapshot = take(lun, "n");
-    const std::string folder = platform.volume + "/export";
+    const std::string folder = volume + "/export";
     _tag_iscsi_export_config_ config{};
     EXPECT_EQ(NORViSCSISnapshotExportConfigGet(folder.c_str(), &config), NORV_ERR_FILE_NOT_FOUND);
     EXPECT_EQ(NORViSCSILunImport(&lun, folder.c_str()), NORV_ERR_FILE_NOT_FOUND);
@@ -324,7 +309,7 @@ TEST_F(SnapshotContract, RetentionKeepsTheNewestAndTheLocked)
     };
     EXPECT_EQ(run(), 0);
     EXPECT_EQ(names(), "oldest newest locked old not its own") << "no policy keeps all";
-    platform.addRetentionPolicy(lun.lid);
+    addRetentionPolicy(lun.lid);
     EXPECT_EQ(run(), 0);
     EXPECT_EQ(names(), "newest locked not its own");
     EXPECT_EQ(run(), 0);

@@ -17,11 +17,9 @@ namespace {
 using Masking = std::map<std::string, int>;
 using Mappings = std::map<int, int>; ///< target ID to LUN number
 
-class TargetContract : public testing::Test {
+class TargetContract : public testing::Test, protected Platform {
 protected:
-    Platform platform;
-
-    TargetContract() { platform.startService(); }
+    TargetContract() { startService(); }
 
     static _tag_iscsi_target_ request(const std::string &name)
     {
@@ -41,17 +39,6 @@ protected:
         _tag_iscsi_target_ target = request(name);
         EXPECT_EQ(NORViSCSITargetCreate(&target), 0) << name;
         return target;
-    }
-
-    _tag_iscsi_lun_ createLUN(const std::string &name)
-    {
-        _tag_iscsi_lun_ lun{};
-        lun.type = NORV_LUN_TYPE_ADV;
-        lun.size = 4 << 20;
-        set(lun.name, name);
-        set(lun.location, platform.volume);
-        EXPECT_EQ(NORViSCSILunCreate(&lun), 0);
-        return lun;
     }
 
     using Answer = std::unique_ptr<_tag_iscsi_conf_, decltype(&NORViSCSIConfFree)>;

@@ -1,7 +1,6 @@
 #include "HostTest.h"
 
 #include "host/services/Retention.h"
-#include "host/state/Fields.h"
 #include "platform/iscsi_snapshot.h"
 #include "platform/retention.h"
 
@@ -93,18 +92,6 @@ TEST(RetentionDecisionTest, SlotsAreLocalTimeAndTheHourThatComesTwiceIsTwo)
     EXPECT_EQ("0,2", kept(at({midnight - 1, midnight, midnight + 1}), {0, 0, 2, 0}, noon));
 }
 
-TEST(RetentionDecisionTest, ReasonsSayWhy)
-{
-    const Zone zone("UTC0");
-    const auto decisions = decideRetention(
-        {{noon - 2 * day, ""}, {noon - day, "locked by the user"}, {noon - hour, ""}, {noon, ""}, {noon + 1, ""}},
-        {1, 2, 1, 0}, noon);
-    const char *const reasons[] = {"no rule keeps it", "locked by the user", "hour 2 of 2",
-                                   "newest 1 of 1, hour 1 of 2, day 1 of 1", "from the future"};
-    for (size_t i = 0; i < decisions.size(); ++i)
-        EXPECT_EQ(reasons[i], decisions[i].reason);
-}
-
 TEST(RetentionPolicyTest, TextBothWays)
 {
     RetentionPolicy policy;
@@ -178,9 +165,7 @@ TEST_F(RetentionRunTest, DeletesWhatThePolicyDoesNotKeep)
 TEST_F(RetentionRunTest, PoliciesBelongToLuns)
 {
     _tag_iscsi_lun_ lun = create("a", NORV_LUN_TYPE_ADV);
-    RetentionPolicy policy{9, 9, 9, 9};
-    ASSERT_EQ(0, iscsihost::getRetentionPolicy(lun.lid, policy));
-    EXPECT_EQ(0, policy.newest + policy.hourly + policy.daily + policy.weekly) << "none";
+    RetentionPolicy policy;
     EXPECT_EQ(NORV_ERR_NO_SUCH_LUN, iscsihost::setRetentionPolicy(9, {1, 0, 0, 0}));
     EXPECT_EQ(NORV_ERR_BAD_PARAMETER, iscsihost::setRetentionPolicy(lun.lid, {}));
     ASSERT_EQ(0, iscsihost::setRetentionPolicy(lun.lid, {1, 0, 0, 2}));
@@ -188,79 +173,13 @@ TEST_F(RetentionRunTest, PoliciesBelongToLuns)
     ASSERT_EQ(0, iscsihost::getRetentionPolicy(lun.lid, policy));
     EXPECT_EQ(3, policy.newest);
     EXPECT_EQ(2, policy.weekly);
-    EXPECT_EQ(0, iscsihost::removeRetentionPolicy(lun.lid));
-    EXPECT_EQ(0, iscsihost::removeRetentionPolicy(lun.lid));
-
-    ASSERT_EQ(0, iscsihost::setRetentionPolicy(lun.lid, {3, 0, 0, 0}));
     ASSERT_EQ(0, NORViSCSILunDelete(&lun)) << iscsi_host_last_error();
     ASSERT_EQ(lun.lid, create("b", NORV_LUN_TYPE_ADV).lid);
     ASSERT_EQ(0, iscsihost::getRetentionPolicy(lun.lid, policy));
     EXPECT_EQ(0, policy.newest) << "the next LUN with this ID has none";
 }
 
-/// The hooks, on real snapshots.
-struct SnapshotRetentionTest : HostTest {
-    _tag_iscsi_lun_ lun = create("a", NORV_LUN_TYPE_ADV);
-
-    _tag_iscsi_snapshot_ take(const char *name, int64_t time)
-    {
-        _tag_iscsi_snapshot_ snapshot = {};
-        copyText(snapshot.name, name);
-        snapshot.snap_time = static_cast<int32_t>(time);
-        EXPECT_EQ(0, NORViSCSISnapshotCreate(&lun, &snapshot)) << iscsi_host_last_error();
-        return snapshot;
-    }
-    int run(const char *key = "1")
-    {
-        return NORVRETENTIONRunPolicy("Lun#", key, NORVRETAINERiSCSIRetentionTargetGet,
-                                      NORVRETAINERiSCSIRetentionTargetDelete, 0);
-    }
-    /// "name reason" of each, newest first.
-    std::vector<std::string> dryRun(const RetentionPolicy *policy, bool kept)
-    {
-        std::vector<iscsihost::RetentionVerdict> verdicts;
-        EXPECT_EQ(0, iscsihost::tryRetention(lun.lid, policy, verdicts)) << iscsi_host_last_error();
-        std::vector<std::string> lines;
-        for (const auto &verdict : verdicts)
-            if (verdict.kept == kept)
-                lines.push_back(verdict.name + ": " + verdict.reason);
-        return lines;
-    }
-};
-
-TEST_F(SnapshotRetentionTest, DeletesWhatTheDryRunNames)
-{
-    const int64_t now = time(nullptr);
-    take("oldest", now - 400);
-    take("old", now - 300);
-    const _tag_iscsi_snapshot_ keyed = take("keyed", now - 200), user = take("user", now - 100);
-    take("new", now);
-    take("future", now + 1000);
-    ASSERT_EQ(0, NORViSCSISnapshotLockByAppKey(&keyed, "backup job"));
-    ASSERT_EQ(0, iscsihost::setSnapshotUserLock(user.uuid, true));
-    const std::vector<std::string> none, all_kept = dryRun(nullptr, true);
-    EXPECT_EQ(6u, all_kept.size());
-    EXPECT_EQ("oldest: the LUN has no retention policy", all_kept.back());
-    EXPECT_EQ(0, run());
-    EXPECT_EQ(none, dryRun(nullptr, false)) << "without a policy nothing goes";
-
-    const RetentionPolicy tried{2, 0, 0, 0};
-    EXPECT_EQ(std::vector<std::string>{"oldest: no rule keeps it"}, dryRun(&tried, false));
-    ASSERT_EQ(0, iscsihost::setRetentionPolicy(lun.lid, {1, 0, 0, 0}));
-    const std::vector<std::string> kept = {"future: from the future", "new: newest 1 of 1", "user: locked by the user",
-                                           "keyed: locked by backup job"};
-    EXPECT_EQ(kept, dryRun(nullptr, true));
-    EXPECT_EQ((std::vector<std::string>{"old: no rule keeps it", "oldest: no rule keeps it"}), dryRun(nullptr, false));
-    EXPECT_EQ(0, run());
-    EXPECT_EQ(kept, dryRun(nullptr, true));
-    EXPECT_EQ(none, dryRun(nullptr, false));
-
-    ASSERT_EQ(0, NORViSCSISnapshotUnlockByAppKey(&keyed, "backup job"));
-    EXPECT_EQ(0, run());
-    EXPECT_EQ(3u, dryRun(nullptr, true).size());
-}
-
-TEST_F(SnapshotRetentionTest, WhatIsNoLun)
+TEST_F(RetentionRunTest, WhatIsNoLun)
 {
     _tag_retention_target_ *targets = nullptr;
     for (const char *key : {"", "x", "1x", "0", "1025", "-1"})

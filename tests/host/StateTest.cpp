@@ -76,15 +76,6 @@ TEST_F(StateTest, UncommittedChangesAreUndone)
     EXPECT_EQ("value", setting("key"));
 }
 
-TEST_F(StateTest, ParentAndChildUseItAfterAFork)
-{
-    ASSERT_EQ(0, setSetting("key", "parent"));
-    const pid_t child = inChild([] { return setSetting("key", "child"); });
-    EXPECT_EQ(0, waitForChild(child));
-    EXPECT_EQ("child", setting("key"));
-    ASSERT_EQ(0, setSetting("key", "parent"));
-}
-
 TEST_F(StateTest, ManyProcessesOpenAndWriteAtOnce)
 {
     closeDatabase();

@@ -67,7 +67,8 @@ private:
 
 PeerTest::PeerTest() : root(makeFolder())
 {
-    useStore("state");
+    setenv("ISCSI_HOST_STATE", (root + "/state").c_str(), 1);
+    EXPECT_EQ(0, makeIdentity()) << reason();
 }
 
 PeerTest::~PeerTest()
@@ -75,13 +76,6 @@ PeerTest::~PeerTest()
     closeDatabase();
     std::error_code ignored;
     std::filesystem::remove_all(root, ignored);
-}
-
-void PeerTest::useStore(const std::string &name)
-{
-    closeDatabase();
-    setenv("ISCSI_HOST_STATE", (root + "/" + name).c_str(), 1);
-    ASSERT_EQ(0, makeIdentity()) << reason();
 }
 
 const BadServer &badServer()

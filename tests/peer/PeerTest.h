@@ -14,9 +14,6 @@ protected:
     PeerTest();
     ~PeerTest() override;
 
-    /// A state store below the test's folder; from now on it is the one that is used.
-    void useStore(const std::string &name);
-
     std::string root; ///< the test's folder
 };
 
