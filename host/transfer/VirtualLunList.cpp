@@ -27,18 +27,36 @@ iscsihost::VirtualLun readRow(const Query &query)
     return vlun;
 }
 
-/// The counters of a transfer that runs move outside of the state store. One that was removed meanwhile keeps those of
-/// its row.
-void addCounters(iscsihost::VirtualLun &vlun)
+/// The counters of a transfer that runs move outside of the state store. False for one that was removed meanwhile.
+bool addCounters(iscsihost::VirtualLun &vlun)
 {
     vlun.running = !vlun.ended && !vlun.dst_lun_uuid.empty();
+    if (!vlun.running)
+        return true;
     _tag_viscsi_virtual_lun_stats_ stats{};
-    if (!vlun.running || NORViSCSIVirtualLunStatsGet(vlun.uuid.c_str(), &stats, 0) != 0)
-        return;
+    if (NORViSCSIVirtualLunStatsGet(vlun.uuid.c_str(), &stats, 0) != 0)
+        return false;
     vlun.moved = stats.first;
     vlun.total = stats.second;
     vlun.state = stats.state;
     vlun.running = stats.state == 0;
+    return true;
+}
+
+/// The latest transfer of a LUN, or the given one, that is there or `removed`.
+int loadTransfer(const std::string &lun, const std::string &one, iscsihost::VirtualLun &found, bool &removed)
+{
+    Query query("SELECT vluns.uuid, luns.uuid, node, sink, portal, moved, total, ended, state, removed FROM "
+                "(SELECT id, uuid, lid, node, sink, portal, moved, total, ended, state, 0 AS removed "
+                "FROM virtual_luns UNION ALL "
+                "SELECT id, uuid, lid, node, sink, portal, moved, total, ended, state, 1 FROM removed_transfers) "
+                "AS vluns JOIN luns USING (lid) "
+                "WHERE luns.uuid = ?1 AND sink <> '' AND ?2 IN (vluns.uuid, '') ORDER BY id DESC LIMIT 1");
+    if (!query.bind(lun).bind(one).next())
+        return query.error() ? query.error() : fail(BAD_VLUN_UUID, "the LUN was never sent to another node");
+    found = readRow(query);
+    removed = query.integer(9) != 0;
+    return 0;
 }
 
 } // namespace
@@ -69,20 +87,11 @@ int findTransfer(const std::string &src_lun_uuid, const std::string &vlun_uuid, 
     const std::string lun = lowerCase(src_lun_uuid), one = lowerCase(vlun_uuid);
     VirtualLun found;
     bool removed = false;
-    {
-        Query query("SELECT vluns.uuid, luns.uuid, node, sink, portal, moved, total, ended, state, removed FROM "
-                    "(SELECT id, uuid, lid, node, sink, portal, moved, total, ended, state, 0 AS removed "
-                    "FROM virtual_luns UNION ALL "
-                    "SELECT id, uuid, lid, node, sink, portal, moved, total, ended, state, 1 FROM removed_transfers) "
-                    "AS vluns JOIN luns USING (lid) "
-                    "WHERE luns.uuid = ?1 AND sink <> '' AND ?2 IN (vluns.uuid, '') ORDER BY id DESC LIMIT 1");
-        if (!query.bind(lun).bind(one).next())
-            return query.error() ? query.error() : fail(BAD_VLUN_UUID, "the LUN was never sent to another node");
-        found = readRow(query);
-        removed = query.integer(9) != 0;
-    }
-    if (!removed)
-        addCounters(found);
+    if (int err = loadTransfer(lun, one, found, removed))
+        return err;
+    if (!removed && !addCounters(found)) // it has ended and is removed now
+        if (int err = loadTransfer(lun, one, found, removed))
+            return err;
     vlun = std::move(found);
     return 0;
 }
