@@ -151,6 +151,9 @@ int judgeMapFile(const Found &file, const std::string &our_store, Verdict &verdi
 
 int sweepOne(const Found &found, const std::string &our_store, SweepResult &result)
 {
+    struct stat status;
+    if (lstat(found.path.c_str(), &status) != 0 && errno == ENOENT)
+        return 0; // who held the LUN when it was listed took it away
     Verdict verdict;
     std::string named_path;
     const auto judge = found.is_snapshot ? judgeSnapshot : judgeMapFile;
