@@ -33,6 +33,7 @@ public:
         folder = std::filesystem::canonical(pattern);
         setenv("ISCSI_HOST_STATE", (folder + "/state").c_str(), 1);
         setenv("ISCSI_HOST_RUN", (folder + "/run").c_str(), 1);
+        setenv("ISCSI_HOST_PROGRESS", (folder + "/progress").c_str(), 1);
         volume = folder + "/volume";
         files = folder + "/files";
         std::filesystem::create_directory(volume);
