@@ -26,11 +26,11 @@ class Appliance(unittest.TestCase):
         self.run_host("volume", "add", self.volume)
 
     def run_host(self, *args):
-        subprocess.run([ISCSI_HOST, *args], env=self.env, check=True, stdout=subprocess.DEVNULL, timeout=60)
+        subprocess.run([ISCSI_HOST, *args], env=self.env, check=True, stdout=subprocess.DEVNULL, timeout=120)
 
     def run_cli(self, *args, stdin=""):
         return subprocess.run([ISCSICTL, *args], env=self.env, input=stdin, capture_output=True, text=True,
-                              errors="surrogateescape", timeout=60)
+                              errors="surrogateescape", timeout=120)
 
     def ok(self, *args, **kwargs):
         result = self.run_cli(*args, **kwargs)

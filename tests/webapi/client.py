@@ -85,7 +85,7 @@ class Served(Appliance):
             self.server = subprocess.Popen([ISCSI_HOST, "web", "run"], env=self.env, stderr=log)
         self.addCleanup(self.server.wait)
         self.addCleanup(self.server.send_signal, signal.SIGTERM)
-        deadline = time.monotonic() + 30
+        deadline = time.monotonic() + 120
         while True:
             try:
                 return socket.create_connection((ADDRESS, 5443)).close()
