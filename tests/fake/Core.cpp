@@ -99,8 +99,7 @@ int NLIBCExec(const char *program, const char *arg1, const char *arg2, const cha
             break;
         arguments += std::string(", ") + argument;
     }
-    if (auto failure = called(__func__, arguments))
-        return *failure;
+    NOTE_CALL(arguments);
     return static_cast<int>(answerOf(__func__, model().exit_status));
 }
 
@@ -135,8 +134,7 @@ void NLIBCSzListFree(NLIBC_SZ_LIST *list)
 
 int NLIBCSzListPush(NLIBC_SZ_LIST *list, const char *text)
 {
-    if (auto failure = called(__func__, text))
-        return *failure;
+    NOTE_CALL(text);
     return pushText(*list, text);
 }
 
@@ -149,8 +147,7 @@ const char *NLIBCSzListGet(const NLIBC_SZ_LIST *list, int index)
 
 int NLIBCFileExist(const char *path)
 {
-    if (auto failure = called(__func__, path))
-        return *failure;
+    NOTE_CALL(path);
     if (isPlatforms(path))
         return model().section_files.count(path) != 0 ? 1 : 0;
     return access(path, F_OK) == 0 ? 1 : 0;
@@ -158,8 +155,7 @@ int NLIBCFileExist(const char *path)
 
 int NLIBCFileGetKeyValue(const char *path, const char *key, char *value, int size)
 {
-    if (auto failure = called(__func__, path, key, size))
-        return *failure;
+    NOTE_CALL(path, key, size);
     std::string text;
     const int found = readKeyValue(path, key, text);
     if (found == 1 && text.size() >= static_cast<size_t>(size))
@@ -171,8 +167,7 @@ int NLIBCFileGetKeyValue(const char *path, const char *key, char *value, int siz
 
 int NLIBCFileCheckKeyValue(const char *path, const char *key, const char *value, int case_sensitive)
 {
-    if (auto failure = called(__func__, path, key, value, case_sensitive))
-        return *failure;
+    NOTE_CALL(path, key, value, case_sensitive);
     std::string text;
     const int found = readKeyValue(path, key, text);
     const auto compare = case_sensitive ? strcmp : strcasecmp;

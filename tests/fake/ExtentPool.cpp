@@ -9,18 +9,15 @@ namespace {
 
 MapFile *byPath(const char *path)
 {
-    for (auto &[lid, lun] : model().luns) {
-        if (mapFilePath(lun.record) == path)
-            return &lun.map_file;
-    }
-    return nullptr;
+    LUN *lun = firstOf(model().luns, [&](const auto &record) { return mapFilePath(record) == path; });
+    return lun ? &lun->map_file : nullptr;
 }
 
 int countOf(const char *name, const char *path, uint64_t MapFile::*count, uint64_t *out)
 {
     const MapFile *file = byPath(path);
-    if (!file)
-        return NORV_ERR_FILE_NOT_FOUND;
+    if (auto failure = calledOn(file, name, path))
+        return *failure;
     *out = static_cast<uint64_t>(answerOf(name, static_cast<long>(file->*count)));
     return 0;
 }
@@ -45,33 +42,24 @@ std::string fake::dataPath(const _tag_iscsi_snapshot_ &snapshot)
 
 int NORVExtentPoolMapFileMappedSizeGet(const char *path, const char *location, uint64_t *size)
 {
-    if (auto failure = called(__func__, path, location))
-        return *failure;
     const MapFile *file = byPath(path);
-    if (!file)
-        return NORV_ERR_FILE_NOT_FOUND;
+    NOTE_CALL_ON(file, path, location);
     *size = file->mapped_size;
     return 0;
 }
 
 int NORVExtentPoolMapFileBaseVersionGet(const char *path, char *version)
 {
-    if (auto failure = called(__func__, path))
-        return *failure;
     const MapFile *file = byPath(path);
-    if (!file)
-        return NORV_ERR_FILE_NOT_FOUND;
+    NOTE_CALL_ON(file, path);
     snprintf(version, 37, "%s", file->base_version.c_str());
     return 0;
 }
 
 int NORVExtentPoolMapFileVersionInfoGet(const char *path, _tag_map_file_version_ *info)
 {
-    if (auto failure = called(__func__, path))
-        return *failure;
     const MapFile *file = byPath(path);
-    if (!file)
-        return NORV_ERR_FILE_NOT_FOUND;
+    NOTE_CALL_ON(file, path);
     put(info->base_version, file->base_version);
     put(info->current_version, file->current_version);
     return 0;
@@ -79,28 +67,21 @@ int NORVExtentPoolMapFileVersionInfoGet(const char *path, _tag_map_file_version_
 
 int NORVExtentPoolMapFileTotalCountGet(const char *path, uint64_t *count)
 {
-    if (auto failure = called(__func__, path))
-        return *failure;
     return countOf(__func__, path, &MapFile::total_count, count);
 }
 
 int NORVExtentPoolMapFileSyncedCountGet(const char *path, uint64_t *count)
 {
-    if (auto failure = called(__func__, path))
-        return *failure;
     return countOf(__func__, path, &MapFile::synced_count, count);
 }
 
 int NORViSCSIChildLunSyncProgressGet(const char *path, uint64_t *done, uint64_t *total)
 {
-    if (auto failure = called(__func__, path))
-        return *failure;
-    for (const auto &[key, snapshot] : model().snapshots) {
-        if (dataPath(snapshot.record) == path) {
-            *done = snapshot.copied;
-            *total = snapshot.to_copy;
-            return 0;
-        }
+    NOTE_CALL(path);
+    if (auto *snapshot = firstOf(model().snapshots, [&](const auto &record) { return dataPath(record) == path; })) {
+        *done = snapshot->copied;
+        *total = snapshot->to_copy;
+        return 0;
     }
     const MapFile *file = byPath(path);
     if (!file)

@@ -3,6 +3,7 @@
 #pragma once
 
 #include "platform/dr_node.h"
+#include "platform/error.h"
 #include "platform/extent_pool.h"
 #include "platform/iscsi_config.h"
 #include "platform/iscsi_lun.h"
@@ -22,6 +23,8 @@ namespace fake {
 
 /// What extent-pool calls answer for a LUN's map file.
 struct MapFile {
+    static constexpr int MISSING = NORV_ERR_FILE_NOT_FOUND; ///< what is answered when there is none
+
     std::string base_version = NORV_ZERO_UUID;
     std::string current_version = NORV_ZERO_UUID;
     uint64_t mapped_size = 0; ///< bytes
@@ -30,6 +33,8 @@ struct MapFile {
 };
 
 struct LUN {
+    static constexpr int MISSING = NORV_ERR_NO_SUCH_LUN;
+
     _tag_iscsi_lun_ record{};
     bool is_loaded = true;
     bool is_locked = false;
@@ -39,6 +44,8 @@ struct LUN {
 };
 
 struct Snapshot {
+    static constexpr int MISSING = NORV_ERR_NO_SUCH_SNAPSHOT;
+
     _tag_iscsi_snapshot_ record{};
     bool is_loaded = false;
     bool is_locked = false; ///< by an action
@@ -47,6 +54,8 @@ struct Snapshot {
 };
 
 struct Target {
+    static constexpr int MISSING = NORV_ERR_NO_SUCH_TARGET;
+
     _tag_iscsi_target_ record{};
     std::vector<std::pair<std::string, int>> masking; ///< IQN and permission, in listing order
 };
@@ -77,11 +86,15 @@ struct Section {
 };
 
 struct VirtualLUN {
+    static constexpr int MISSING = NORV_ERR_VLUN_UUID;
+
     _tag_viscsi_virtual_lun_ record{};
     Answers<_tag_viscsi_virtual_lun_stats_> stats;
 };
 
 struct Task {
+    static constexpr int MISSING = NORV_ERR_NO_SUCH_TASK;
+
     _tag_iscsi_task_ record{};
     Answers<_tag_iscsi_task_progress_> progress;
     uint64_t unsync_size = 0; ///< bytes

@@ -139,8 +139,7 @@ int NORVFSMkdirP(const char *path, int flags, int parents, int uid, int gid, int
 
 int NLIBCFileTouch(const char *path)
 {
-    if (auto failure = called(__func__, path))
-        return *failure;
+    NOTE_CALL(path);
     model().section_files[path];
     return 0;
 }
@@ -162,8 +161,7 @@ void NLIBCSzHashFree(NLIBC_SZ_HASH *hash)
 
 int NLIBCSzHashSetValue(NLIBC_SZ_HASH *hash, const char *key, const char *value)
 {
-    if (auto failure = called(__func__, key, value))
-        return *failure;
+    NOTE_CALL(key, value);
     if (std::string *known = findValue(hash->values, key))
         *known = value;
     else
@@ -181,8 +179,7 @@ const char *NLIBCSzHashGetValue(const NLIBC_SZ_HASH *hash, const char *key)
 
 int NLIBCFileGetSection(const char *path, const char *section, NLIBC_SZ_HASH *keys)
 {
-    if (auto failure = called(__func__, path, section))
-        return *failure;
+    NOTE_CALL(path, section);
     if (model().section_files.count(path) == 0)
         return -1;
     const Section *known = findSection(path, section);
@@ -194,8 +191,7 @@ int NLIBCFileGetSection(const char *path, const char *section, NLIBC_SZ_HASH *ke
 
 int NLIBCFileAddSection(const char *path, const char *section, const NLIBC_SZ_HASH *keys, const char *line_format)
 {
-    if (auto failure = called(__func__, path, section, keyLines(*keys, line_format)))
-        return *failure;
+    NOTE_CALL(path, section, keyLines(*keys, line_format));
     if (model().section_files.count(path) == 0 || findSection(path, section) || !isWritable(section, *keys))
         return 0;
     model().section_files[path].push_back({section, keys->values});
@@ -205,8 +201,7 @@ int NLIBCFileAddSection(const char *path, const char *section, const NLIBC_SZ_HA
 int NLIBCFileSetSection(const char *path, const char *section, const char *new_name, const NLIBC_SZ_HASH *keys,
                         const char *line_format)
 {
-    if (auto failure = called(__func__, path, section, new_name, keyLines(*keys, line_format)))
-        return *failure;
+    NOTE_CALL(path, section, new_name, keyLines(*keys, line_format));
     Section *known = findSection(path, section);
     const bool is_taken = strcmp(section, new_name) != 0 && findSection(path, new_name);
     if (!known || is_taken || !isWritable(new_name, *keys))
@@ -217,8 +212,7 @@ int NLIBCFileSetSection(const char *path, const char *section, const char *new_n
 
 int NLIBCFileRemoveSection(const char *path, const char *section)
 {
-    if (auto failure = called(__func__, path, section))
-        return *failure;
+    NOTE_CALL(path, section);
     auto &sections = model().section_files[path];
     sections.erase(
         std::remove_if(sections.begin(), sections.end(), [&](const Section &known) { return known.name == section; }),
@@ -228,8 +222,7 @@ int NLIBCFileRemoveSection(const char *path, const char *section)
 
 int NLIBCFileEnumSection(const char *path, NLIBC_SZ_LIST *names)
 {
-    if (auto failure = called(__func__, path))
-        return *failure;
+    NOTE_CALL(path);
     for (const Section &section : model().section_files[path]) {
         if (pushText(*names, section.name) < 0)
             return -1;
@@ -239,15 +232,13 @@ int NLIBCFileEnumSection(const char *path, NLIBC_SZ_LIST *names)
 
 int NLIBCFileLockByFile(const char *path, int exclusive, int *fd)
 {
-    if (auto failure = called(__func__, path, exclusive))
-        return *failure;
+    NOTE_CALL(path, exclusive);
     return lockFile(path, fd);
 }
 
 int NLIBCFileLockTimeByFile(const char *path, int exclusive, int seconds, int *fd)
 {
-    if (auto failure = called(__func__, path, exclusive, seconds))
-        return *failure;
+    NOTE_CALL(path, exclusive, seconds);
     return answerOf(__func__, 1) == 1 ? lockFile(path, fd) : 0;
 }
 

@@ -28,29 +28,25 @@ long findJob(Test test)
 
 long NORViSCSILunTaskGetSchIDByName(const char *lun_name)
 {
-    if (auto failure = called(__func__, lun_name))
-        return *failure;
+    NOTE_CALL(lun_name);
     return answerOf(__func__, findJob([&](const Job &job) { return job.lun_name == lun_name; }));
 }
 
 long ScheduleSnapshotTaskGetIDByLid(int lid)
 {
-    if (auto failure = called(__func__, lid))
-        return *failure;
+    NOTE_CALL(lid);
     return answerOf(__func__, findJob([&](const Job &job) { return job.lid == lid; }));
 }
 
 int NORVSchedTaskRemove(long id)
 {
-    if (auto failure = called(__func__, id))
-        return *failure;
+    NOTE_CALL(id);
     return model().jobs.erase(id) == 1 ? 0 : -1;
 }
 
 int NORVRETENTIONRemovePolicy(const char *kind, const char *key)
 {
-    if (auto failure = called(__func__, kind, key))
-        return *failure;
+    NOTE_CALL(kind, key);
     model().retention_policies.erase({kind, key});
     return 0;
 }
@@ -60,8 +56,7 @@ int NORVRETENTIONRunPolicy(const char *kind, const char *key, NORV_RETENTION_TAR
 {
     const bool has_hooks =
         get == NORVRETAINERiSCSIRetentionTargetGet && remove == NORVRETAINERiSCSIRetentionTargetDelete;
-    if (auto failure = called(__func__, kind, key, has_hooks ? "snapshot hooks" : "other hooks", flags))
-        return *failure;
+    NOTE_CALL(kind, key, has_hooks ? "snapshot hooks" : "other hooks", flags);
     if (model().retention_policies.count({kind, key}) == 0)
         return 0;
     std::vector<_tag_retention_target_> targets;
@@ -84,8 +79,7 @@ int NORVRETENTIONRunPolicy(const char *kind, const char *key, NORV_RETENTION_TAR
 
 int NORVRETAINERiSCSIRetentionTargetGet(const char *key, _tag_retention_target_ **targets)
 {
-    if (auto failure = called(__func__, key))
-        return *failure;
+    NOTE_CALL(key);
     *targets = nullptr;
     for (const auto &[place, snapshot] : model().snapshots) {
         if (std::to_string(place.first) != key)
@@ -104,8 +98,7 @@ int NORVRETAINERiSCSIRetentionTargetGet(const char *key, _tag_retention_target_ 
 
 int NORVRETAINERiSCSIRetentionTargetDelete(const char *key, const _tag_retention_target_ *target)
 {
-    if (auto failure = called(__func__, key, target->uuid))
-        return *failure;
+    NOTE_CALL(key, target->uuid);
     auto &snapshots = model().snapshots;
     const auto found = std::find_if(snapshots.begin(), snapshots.end(), [&](const auto &entry) {
         return textOf(entry.second.record.uuid) == target->uuid;

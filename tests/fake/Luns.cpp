@@ -11,35 +11,19 @@ using namespace fake;
 
 namespace {
 
-template <class Test>
-LUN *findLUN(Test test)
-{
-    for (auto &[lid, lun] : model().luns) {
-        if (test(lun.record))
-            return &lun;
-    }
-    return nullptr;
-}
-
 LUN *byUUID(const char *uuid)
 {
-    return findLUN([&](const auto &record) { return strcmp(record.uuid, uuid) == 0; });
+    return firstOf(model().luns, [&](const auto &record) { return strcmp(record.uuid, uuid) == 0; });
 }
 
 LUN *byName(const char *name)
 {
-    return findLUN([&](const auto &record) { return strcmp(record.name, name) == 0; });
+    return firstOf(model().luns, [&](const auto &record) { return strcmp(record.name, name) == 0; });
 }
 
 LUN *byID(int lid)
 {
-    const auto found = model().luns.find(lid);
-    return found == model().luns.end() ? nullptr : &found->second;
-}
-
-int copyOut(const LUN *lun, _tag_iscsi_lun_ *out)
-{
-    return copyRecord(lun ? &lun->record : nullptr, out, NORV_ERR_NO_SUCH_LUN);
+    return valueOf(model().luns, lid);
 }
 
 bool isMapped(int lid)
@@ -50,19 +34,9 @@ bool isMapped(int lid)
 
 bool isType(int type)
 {
-    switch (type) {
-    case NORV_LUN_TYPE_BLOCK:
-    case NORV_LUN_TYPE_FILE:
-    case NORV_LUN_TYPE_THIN:
-    case NORV_LUN_TYPE_ADV:
-    case NORV_LUN_TYPE_SINK:
-    case NORV_LUN_TYPE_47:
-    case NORV_LUN_TYPE_71:
-    case NORV_LUN_TYPE_79:
-        return true;
-    default:
-        return false;
-    }
+    const auto types = {NORV_LUN_TYPE_BLOCK, NORV_LUN_TYPE_FILE, NORV_LUN_TYPE_THIN, NORV_LUN_TYPE_ADV,
+                        NORV_LUN_TYPE_SINK,  NORV_LUN_TYPE_47,   NORV_LUN_TYPE_71,   NORV_LUN_TYPE_79};
+    return std::find(types.begin(), types.end(), type) != types.end();
 }
 
 bool isSize(uint64_t size)
@@ -118,17 +92,13 @@ std::string idList(const int ids[], int count)
 }
 
 /// Loads or unloads; with the trash option the LUN also leaves or enters the trash.
-int setLoaded(const _tag_iscsi_lun_ *record, bool is_loaded)
+int setLoaded(const char *name, const _tag_iscsi_lun_ &record, bool is_loaded)
 {
-    LUN *lun = byUUID(record->uuid);
-    if (!lun)
-        return NORV_ERR_NO_SUCH_LUN;
-    if (record->options & NORV_LUN_OPTION_TRASH) {
-        if (is_loaded)
-            lun->record.options &= ~static_cast<uint32_t>(NORV_LUN_OPTION_TRASH);
-        else
-            lun->record.options |= NORV_LUN_OPTION_TRASH;
-    }
+    LUN *lun = byUUID(record.uuid);
+    if (auto failure = calledOn(lun, name, record.uuid, record.options))
+        return *failure;
+    const uint32_t trash = record.options & NORV_LUN_OPTION_TRASH;
+    lun->record.options = is_loaded ? lun->record.options & ~trash : lun->record.options | trash;
     lun->is_loaded = is_loaded;
     return 0;
 }
@@ -157,9 +127,7 @@ int fake::createLUN(_tag_iscsi_lun_ &lun)
 
 int NORViSCSILunConfigGetByUUID(const char *uuid, _tag_iscsi_lun_ *lun, int flags)
 {
-    if (auto failure = called(__func__, uuid, flags))
-        return *failure;
-    return copyOut(byUUID(uuid), lun);
+    return answerRecord(byUUID(uuid), lun, __func__, uuid, flags);
 }
 
 int NORViSCSILunConfigGetAll(_tag_iscsi_lun_ **luns, size_t *count)
@@ -182,40 +150,31 @@ int NORViSCSILunConfigGetAll(_tag_iscsi_lun_ **luns, size_t *count)
 
 int NORViSCSILunGetByLunId(int lid, _tag_iscsi_lun_ *lun)
 {
-    if (auto failure = called(__func__, lid))
-        return *failure;
-    return copyOut(byID(lid), lun);
+    return answerRecord(byID(lid), lun, __func__, lid);
 }
 
 int NORViSCSILunGetByLunName(const char *name, _tag_iscsi_lun_ *lun)
 {
-    if (auto failure = called(__func__, name))
-        return *failure;
-    return copyOut(byName(name), lun);
+    return answerRecord(byName(name), lun, __func__, name);
 }
 
 int NORViSCSILunIsNameExist(const char *name, bool *exists)
 {
-    if (auto failure = called(__func__, name))
-        return *failure;
+    NOTE_CALL(name);
     *exists = byName(name) != nullptr;
     return 0;
 }
 
 int NORViSCSILunCreate(_tag_iscsi_lun_ *lun)
 {
-    if (auto failure = called(__func__, lun->name, lun->type, lun->location, lun->size, lun->extent_size))
-        return *failure;
+    NOTE_CALL(lun->name, lun->type, lun->location, lun->size, lun->extent_size);
     return createLUN(*lun);
 }
 
 int NORViSCSILunDelete(_tag_iscsi_lun_ *lun)
 {
-    if (auto failure = called(__func__, lun->uuid))
-        return *failure;
     const LUN *known = byUUID(lun->uuid);
-    if (!known)
-        return NORV_ERR_NO_SUCH_LUN;
+    NOTE_CALL_ON(known, lun->uuid);
     if (isMapped(known->record.lid))
         return NORV_ERR_LUN_MAPPED;
     if (known->is_locked)
@@ -226,11 +185,8 @@ int NORViSCSILunDelete(_tag_iscsi_lun_ *lun)
 
 int NORViSCSILunUpdate(_tag_iscsi_lun_ *lun)
 {
-    if (auto failure = called(__func__, lun->uuid, lun->name, lun->size))
-        return *failure;
     LUN *known = byUUID(lun->uuid);
-    if (!known)
-        return NORV_ERR_NO_SUCH_LUN;
+    NOTE_CALL_ON(known, lun->uuid, lun->name, lun->size);
     if (!isName(lun->name, sizeof(lun->name) - 1))
         return NORV_ERR_LUN_NAME;
     if (const LUN *other = byName(lun->name); other && other != known)
@@ -246,36 +202,26 @@ int NORViSCSILunUpdate(_tag_iscsi_lun_ *lun)
 
 int NORViSCSILunLoad(_tag_iscsi_lun_ *lun)
 {
-    if (auto failure = called(__func__, lun->uuid, lun->options))
-        return *failure;
-    return setLoaded(lun, true);
+    return setLoaded(__func__, *lun, true);
 }
 
 int NORViSCSILunUnload(_tag_iscsi_lun_ *lun)
 {
-    if (auto failure = called(__func__, lun->uuid, lun->options))
-        return *failure;
-    return setLoaded(lun, false);
+    return setLoaded(__func__, *lun, false);
 }
 
 int NORViSCSILunIsLocked(const _tag_iscsi_lun_ *lun, bool *locked)
 {
-    if (auto failure = called(__func__, lun->lid))
-        return *failure;
     const LUN *known = byID(lun->lid);
-    if (!known)
-        return NORV_ERR_NO_SUCH_LUN;
+    NOTE_CALL_ON(known, lun->lid);
     *locked = answerOf(__func__, known->is_locked) != 0;
     return 0;
 }
 
 int NORViSCSILunProgressGet(const _tag_iscsi_lun_ *lun, _tag_iscsi_lun_progress_ *progress)
 {
-    if (auto failure = called(__func__, lun->lid))
-        return *failure;
     const LUN *known = byID(lun->lid);
-    if (!known)
-        return NORV_ERR_NO_SUCH_LUN;
+    NOTE_CALL_ON(known, lun->lid);
     progress->st = static_cast<int32_t>(answerOf(__func__, known->progress));
     progress->percent = -1;
     return 0;
@@ -283,8 +229,7 @@ int NORViSCSILunProgressGet(const _tag_iscsi_lun_ *lun, _tag_iscsi_lun_progress_
 
 int NORViSCSIFamilyConfGetByLID(int lid, _tag_iscsi_family_ *family)
 {
-    if (auto failure = called(__func__, lid))
-        return *failure;
+    NOTE_CALL(lid);
     const LUN *known = byID(lid);
     if (!known)
         return NORV_ERR_NO_SUCH_FAMILY;
@@ -295,8 +240,7 @@ int NORViSCSIFamilyConfGetByLID(int lid, _tag_iscsi_family_ *family)
 
 int NORViSCSILunMappingsAdd(const int target_ids[], int lid, int count)
 {
-    if (auto failure = called(__func__, idList(target_ids, count), lid, count))
-        return *failure;
+    NOTE_CALL(idList(target_ids, count), lid, count);
     if (!byID(lid))
         return NORV_ERR_NO_SUCH_LUN;
     for (int i = 0; i < count; ++i) {
@@ -312,8 +256,7 @@ int NORViSCSILunMappingsAdd(const int target_ids[], int lid, int count)
 
 int NORViSCSILunMappingsRemove(const int target_ids[], int lid, int count)
 {
-    if (auto failure = called(__func__, idList(target_ids, count), lid, count))
-        return *failure;
+    NOTE_CALL(idList(target_ids, count), lid, count);
     for (int i = 0; i < count; ++i) {
         if (findMapping(target_ids[i], lid) == model().mappings.end())
             return NORV_ERR_NO_SUCH_MAPPING;

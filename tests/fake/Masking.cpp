@@ -70,23 +70,17 @@ int setEntry(Target &target, const std::string &iqn, int permission)
 
 int NORViSCSIDefaultACLSet(const _tag_iscsi_target_ *target, int permission)
 {
-    if (auto failure = called(__func__, target->tid, permission))
-        return *failure;
-    const auto found = model().targets.find(target->tid);
-    if (found == model().targets.end())
-        return NORV_ERR_NO_SUCH_TARGET;
-    return setEntry(found->second, NORV_DEFAULT_MASKING_IQN, permission);
+    Target *known = valueOf(model().targets, target->tid);
+    NOTE_CALL_ON(known, target->tid, permission);
+    return setEntry(*known, NORV_DEFAULT_MASKING_IQN, permission);
 }
 
 int NORViSCSITargetMaskingGet(int tid, Entries &entries)
 {
-    if (auto failure = called(__func__, tid))
-        return *failure;
-    const auto found = model().targets.find(tid);
-    if (found == model().targets.end())
-        return NORV_ERR_NO_SUCH_TARGET;
+    const Target *known = valueOf(model().targets, tid);
+    NOTE_CALL_ON(known, tid);
     entries.clear();
-    for (const auto &[iqn, permission] : found->second.masking) {
+    for (const auto &[iqn, permission] : known->masking) {
         _tag_struct_iscsi_acl_ entry{};
         entry.tid = tid;
         put(entry.iqn, iqn);
@@ -98,15 +92,13 @@ int NORViSCSITargetMaskingGet(int tid, Entries &entries)
 
 int NORViSCSIMaskingsCreate(const Entries &entries)
 {
-    if (auto failure = called(__func__, tidOf(entries), listed(entries)))
-        return *failure;
+    NOTE_CALL(tidOf(entries), listed(entries));
     return changeAll(entries, setEntry);
 }
 
 int NORViSCSIMaskingsUpdate(const Entries &entries)
 {
-    if (auto failure = called(__func__, tidOf(entries), listed(entries)))
-        return *failure;
+    NOTE_CALL(tidOf(entries), listed(entries));
     return changeAll(entries, [](Target &target, const std::string &iqn, int permission) {
         return find(target, iqn) == target.masking.end() ? NORV_ERR_TARGET_ACL : setEntry(target, iqn, permission);
     });
@@ -114,8 +106,7 @@ int NORViSCSIMaskingsUpdate(const Entries &entries)
 
 int NORViSCSIMaskingsRemove(const Entries &entries)
 {
-    if (auto failure = called(__func__, tidOf(entries), listed(entries)))
-        return *failure;
+    NOTE_CALL(tidOf(entries), listed(entries));
     return changeAll(entries, [](Target &target, const std::string &iqn, int) {
         const auto entry = find(target, iqn);
         if (entry == target.masking.end())

@@ -131,8 +131,7 @@ bool DRNodeDB::SetAttr(const DRNodeAttr &attr)
 
 int NORVExtentPoolRODKeyGet(char *key, int size)
 {
-    if (auto failure = called(__func__, size))
-        return *failure;
+    NOTE_CALL(size);
     return putText(key, size, model().rod_key);
 }
 
@@ -188,8 +187,7 @@ int NORVCredItemSetRemotePasswd(NORV_CRED *cred, const char *password)
 
 int NORVCredSessItemGetAccessToken(char *token, int size, const NORV_CRED_SESS *session)
 {
-    if (auto failure = called(__func__, size))
-        return *failure;
+    NOTE_CALL(size);
     return putText(token, size, session->token);
 }
 
@@ -221,8 +219,7 @@ bool CredRequestUtil::Logout(const NORV_CRED *cred, const std::string &token)
 
 int NorvCgiInit(const char *arguments, NORV_CGI **cgi)
 {
-    if (auto failure = called(__func__, arguments))
-        return *failure;
+    NOTE_CALL(arguments);
     *cgi = makeHandle<NORV_CGI>();
     return 0;
 }
@@ -244,8 +241,7 @@ int NorvCgiSetOption(NORV_CGI *cgi, int option, const char *value)
 
 int NorvCgiLoginNoAuth(NORV_CGI *cgi, char *session, int size, const NORV_CGI_IDENTITY &identity)
 {
-    if (auto failure = called(__func__, size, identity.user))
-        return *failure;
+    NOTE_CALL(size, identity.user);
     const std::string name = "session-of-" + cgi->options[NORV_CGI_HOST];
     if (putText(session, size, name))
         return 0;
@@ -262,8 +258,7 @@ bool NorvCgiRemoveSessionByIndex(NORV_CGI *, int kind, const char *session)
 
 int NORVUserGetUGID(const char *name, unsigned int *uid, unsigned int *gid)
 {
-    if (auto failure = called(__func__, name))
-        return *failure;
+    NOTE_CALL(name);
     const auto found = model().account_ids.find(name);
     if (found == model().account_ids.end())
         return -1;
@@ -274,8 +269,7 @@ int NORVUserGetUGID(const char *name, unsigned int *uid, unsigned int *gid)
 
 int NORVCheckModule(const char *name)
 {
-    if (auto failure = called(__func__, name))
-        return *failure;
+    NOTE_CALL(name);
     return model().missing_modules.count(name) == 0 ? 1 : 0;
 }
 

@@ -11,8 +11,7 @@ namespace {
 
 VirtualLUN *findVirtualLUN(const char *uuid)
 {
-    const auto found = model().virtual_luns.find(uuid);
-    return found == model().virtual_luns.end() ? nullptr : &found->second;
+    return valueOf(model().virtual_luns, uuid);
 }
 
 Task *findTask(const char *uuid)
@@ -24,20 +23,10 @@ Task *findTask(const char *uuid)
     return nullptr;
 }
 
-/// What a function of one task does first; `task` is set when it answers nothing.
-template <class... Arguments>
-std::optional<int> calledOnTask(const char *name, const char *uuid, Task *&task, const Arguments &...arguments)
-{
-    if (auto failure = called(name, uuid, arguments...))
-        return failure;
-    task = findTask(uuid);
-    return task ? std::nullopt : std::optional<int>(NORV_ERR_NO_SUCH_TASK);
-}
-
 int convert(const char *name, const _tag_iscsi_task_ *record, bool to_source)
 {
-    Task *task = nullptr;
-    if (auto failure = calledOnTask(name, record->uuid, task))
+    Task *task = findTask(record->uuid);
+    if (auto failure = calledOn(task, name, record->uuid))
         return *failure;
     task->record.is_source = to_source;
     return 0;
@@ -47,11 +36,8 @@ int convert(const char *name, const _tag_iscsi_task_ *record, bool to_source)
 
 int NORViSCSIVirtualLunCreate(const char *src_lun_uuid, int mode, char *uuid, int flags)
 {
-    if (auto failure = called(__func__, src_lun_uuid, mode, flags))
-        return *failure;
     const LUN *source = findLUN(src_lun_uuid);
-    if (!source)
-        return NORV_ERR_NO_SUCH_LUN;
+    NOTE_CALL_ON(source, src_lun_uuid, mode, flags);
     VirtualLUN vlun;
     char made[37];
     makeUUID(made);
@@ -65,43 +51,31 @@ int NORViSCSIVirtualLunCreate(const char *src_lun_uuid, int mode, char *uuid, in
 
 int NORViSCSIVirtualLunRemove(const char *uuid)
 {
-    if (auto failure = called(__func__, uuid))
-        return *failure;
+    NOTE_CALL(uuid);
     return model().virtual_luns.erase(uuid) == 1 ? 0 : NORV_ERR_VLUN_UUID;
 }
 
 int NORViSCSIVirtualLunBindSink(const char *uuid, const char *portal, const char *node_uuid, const char *dst_lun_uuid)
 {
-    if (auto failure = called(__func__, uuid, portal, node_uuid, dst_lun_uuid))
-        return *failure;
-    return findVirtualLUN(uuid) ? 0 : NORV_ERR_VLUN_UUID;
+    return calledOn(findVirtualLUN(uuid), __func__, uuid, portal, node_uuid, dst_lun_uuid).value_or(0);
 }
 
 int NORViSCSIVirtualLunStatsGet(const char *uuid, _tag_viscsi_virtual_lun_stats_ *stats, int flags)
 {
-    if (auto failure = called(__func__, uuid, flags))
-        return *failure;
     VirtualLUN *vlun = findVirtualLUN(uuid);
-    if (!vlun)
-        return NORV_ERR_VLUN_UUID;
+    NOTE_CALL_ON(vlun, uuid, flags);
     *stats = vlun->stats.take();
     return 0;
 }
 
 int NORViSCSIVirtualLunFillByUUID(const char *uuid, _tag_viscsi_virtual_lun_ *vlun, int flag)
 {
-    if (auto failure = called(__func__, uuid, flag))
-        return *failure;
-    const VirtualLUN *known = findVirtualLUN(uuid);
-    return copyRecord(known ? &known->record : nullptr, vlun, NORV_ERR_VLUN_UUID);
+    return answerRecord(findVirtualLUN(uuid), vlun, __func__, uuid, flag);
 }
 
 int NORViSCSIReplicationTaskConfGetByUUID(const char *uuid, _tag_iscsi_task_ *record)
 {
-    if (auto failure = called(__func__, uuid))
-        return *failure;
-    const Task *task = findTask(uuid);
-    return copyRecord(task ? &task->record : nullptr, record, NORV_ERR_NO_SUCH_TASK);
+    return answerRecord(findTask(uuid), record, __func__, uuid);
 }
 
 int NORViSCSIReplicationTaskConfLoad(const _tag_iscsi_task_selection_ *selection, int *count, _tag_iscsi_task_ *head,
@@ -128,10 +102,8 @@ int NORViSCSIReplicationTaskConfLoad(const _tag_iscsi_task_selection_ *selection
 
 int NORViSCSIReplicationTaskCreate(_tag_iscsi_task_ *record)
 {
-    if (auto failure =
-            called(__func__, record->uuid, record->is_source ? "source" : "destination", record->src_lun_uuid,
-                   record->dst_lun_uuid, record->src_node_uuid, record->dst_node_uuid, record->root_path))
-        return *failure;
+    NOTE_CALL(record->uuid, record->is_source ? "source" : "destination", record->src_lun_uuid, record->dst_lun_uuid,
+              record->src_node_uuid, record->dst_node_uuid, record->root_path);
     if (record->is_source)
         makeUUID(record->uuid);
     Task task;
@@ -142,9 +114,8 @@ int NORViSCSIReplicationTaskCreate(_tag_iscsi_task_ *record)
 
 int NORViSCSIReplicationTaskDelete(const _tag_iscsi_task_ *record)
 {
-    Task *task = nullptr;
-    if (auto failure = calledOnTask(__func__, record->uuid, task))
-        return *failure;
+    Task *task = findTask(record->uuid);
+    NOTE_CALL_ON(task, record->uuid);
     model().tasks.erase(model().tasks.begin() + (task - model().tasks.data()));
     return 0;
 }
@@ -158,24 +129,21 @@ int NORViSCSIReplicationTaskSendSnapshot(const _tag_iscsi_task_ *record, const c
                                          const char *snapshot_uuid, const char *base_version, unsigned int port,
                                          bool full_sync, bool encrypted, bool last_try)
 {
-    Task *task = nullptr;
-    return calledOnTask(__func__, record->uuid, task, address, rod_key, snapshot_uuid,
-                        base_version ? base_version : "(null)", port, full_sync ? "full" : "difference",
-                        encrypted ? "encrypted" : "plain", last_try ? "last try" : "not the last try")
+    return calledOn(findTask(record->uuid), __func__, record->uuid, address, rod_key, snapshot_uuid,
+                    base_version ? base_version : "(null)", port, full_sync ? "full" : "difference",
+                    encrypted ? "encrypted" : "plain", last_try ? "last try" : "not the last try")
         .value_or(0);
 }
 
 int NORViSCSIReplicationTaskStopSendingSnapshot(const _tag_iscsi_task_ *record)
 {
-    Task *task = nullptr;
-    return calledOnTask(__func__, record->uuid, task).value_or(0);
+    return calledOn(findTask(record->uuid), __func__, record->uuid).value_or(0);
 }
 
 int NORViSCSIReplicationTaskProgressGetByTask(const _tag_iscsi_task_ *record, _tag_iscsi_task_progress_ *progress)
 {
-    Task *task = nullptr;
-    if (auto failure = calledOnTask(__func__, record->uuid, task))
-        return *failure;
+    Task *task = findTask(record->uuid);
+    NOTE_CALL_ON(task, record->uuid);
     *progress = task->progress.take();
     put(progress->task_uuid, textOf(record->uuid));
     return 0;
@@ -183,9 +151,8 @@ int NORViSCSIReplicationTaskProgressGetByTask(const _tag_iscsi_task_ *record, _t
 
 int NORViSCSIReplicationTaskProgressAdd(const _tag_iscsi_task_progress_ *progress)
 {
-    Task *task = nullptr;
-    if (auto failure = calledOnTask(__func__, progress->task_uuid, task, progress->error))
-        return *failure;
+    Task *task = findTask(progress->task_uuid);
+    NOTE_CALL_ON(task, progress->task_uuid, progress->error);
     task->progress = {{*progress}};
     return 0;
 }
@@ -193,15 +160,14 @@ int NORViSCSIReplicationTaskProgressAdd(const _tag_iscsi_task_progress_ *progres
 int NORViSCSIReplicationTaskUnsyncSizeComputeStart(const _tag_iscsi_task_ *record, const _tag_iscsi_snapshot_ *base,
                                                    const _tag_iscsi_snapshot_ *snapshot)
 {
-    Task *task = nullptr;
-    return calledOnTask(__func__, record->uuid, task, base ? base->uuid : "(null)", snapshot->uuid).value_or(0);
+    return calledOn(findTask(record->uuid), __func__, record->uuid, base ? base->uuid : "(null)", snapshot->uuid)
+        .value_or(0);
 }
 
 int NORViSCSIReplicationTaskUnsyncSizeGet(const _tag_iscsi_task_ *record, uint64_t *size, bool *completed)
 {
-    Task *task = nullptr;
-    if (auto failure = calledOnTask(__func__, record->uuid, task))
-        return *failure;
+    Task *task = findTask(record->uuid);
+    NOTE_CALL_ON(task, record->uuid);
     *size = task->unsync_size;
     *completed = true;
     return 0;
@@ -219,8 +185,7 @@ int NORViSCSIReplicationTaskConvertSrcToDst(const _tag_iscsi_task_ *record)
 
 int NORViSCSILunConvertSinkToAdv(const _tag_iscsi_lun_ *record)
 {
-    if (auto failure = called(__func__, record->uuid))
-        return *failure;
+    NOTE_CALL(record->uuid);
     LUN *lun = findLUN(record->uuid);
     if (!lun || lun->record.type != NORV_LUN_TYPE_SINK)
         return NORV_ERR_BAD_PARAMETER;

@@ -33,16 +33,48 @@ std::string joined(const First &first, const Rest &...rest)
     return text.str();
 }
 
-/// The first thing that every function of the platform does:
-///
-///     if (auto failure = called(__func__, uuid))
-///         return *failure;
+/// Notes a call with its key arguments; the code that the script wants it to fail with, if any.
 template <class... Arguments>
 std::optional<int> called(const char *name, const Arguments &...arguments)
 {
     if (auto failure = noteCall(name, joined(arguments...)))
         return static_cast<int>(*failure);
     return std::nullopt;
+}
+
+/// The same of a function about one object, whose absence is an answer too.
+template <class Object, class... Arguments>
+std::optional<int> calledOn(const Object *object, const char *name, const Arguments &...arguments)
+{
+    if (auto failure = called(name, arguments...))
+        return failure;
+    return object ? std::nullopt : std::optional<int>(Object::MISSING);
+}
+
+/// The first thing that a function of the platform does: it notes its call, and returns at once if it is to fail.
+#define NOTE_CALL(...)                                                                                                 \
+    if (auto failure = fake::called(__func__, __VA_ARGS__))                                                            \
+    return *failure
+
+/// The same of a function about one object, which also returns when there is none.
+#define NOTE_CALL_ON(object, ...)                                                                                      \
+    if (auto failure = fake::calledOn(object, __func__, __VA_ARGS__))                                                  \
+    return *failure
+
+/// The value of a key, null when there is none.
+template <class Map>
+auto *valueOf(Map &map, const typename Map::key_type &key)
+{
+    const auto found = map.find(key);
+    return found == map.end() ? nullptr : &found->second;
+}
+
+/// The first value whose record passes the test, null when none does.
+template <class Map, class Test>
+auto *firstOf(Map &map, Test test)
+{
+    const auto found = std::find_if(map.begin(), map.end(), [&](auto &entry) { return test(entry.second.record); });
+    return found == map.end() ? nullptr : &found->second;
 }
 
 /// Copies a text into a character field that is known to hold it.
@@ -62,18 +94,25 @@ std::string textOf(const char (&field)[size])
 /// Whether a text can name an object: 1 to `longest` bytes, none of them a control character or "/".
 bool isName(const std::string &text, size_t longest);
 
-/// Answers with a record, or `missing` for null. Callers zero theirs first: what an appliance leaves
-/// out of it must not be an earlier object's.
+/// Answers with a record. Callers zero theirs first: what an appliance leaves out of it must not be an earlier
+/// object's.
 template <class Record>
-int copyRecord(const Record *record, Record *out, int missing)
+int copyRecord(const Record &record, Record *out)
 {
     static const Record zero{};
     if (memcmp(out, &zero, sizeof(zero)) != 0)
         return NORV_ERR_BAD_PARAMETER;
-    if (!record)
-        return missing;
-    *out = *record;
+    *out = record;
     return 0;
+}
+
+/// A function that answers with an object's record.
+template <class Object, class Record, class... Arguments>
+int answerRecord(const Object *object, Record *out, const char *name, const Arguments &...arguments)
+{
+    if (auto failure = calledOn(object, name, arguments...))
+        return *failure;
+    return copyRecord(object->record, out);
 }
 
 /// A UUID that no other object has.

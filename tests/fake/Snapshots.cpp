@@ -13,29 +13,15 @@ using namespace fake;
 
 namespace {
 
-template <class Test>
-Snapshot *find(Test test)
-{
-    for (auto &[key, snapshot] : model().snapshots) {
-        if (test(snapshot.record))
-            return &snapshot;
-    }
-    return nullptr;
-}
-
 Snapshot *byUUID(const char *uuid)
 {
-    return find([&](const auto &record) { return strcmp(record.uuid, uuid) == 0; });
+    return firstOf(model().snapshots, [&](const auto &record) { return strcmp(record.uuid, uuid) == 0; });
 }
 
 Snapshot *byName(int lid, const char *name)
 {
-    return find([&](const auto &record) { return record.lid == lid && strcmp(record.name, name) == 0; });
-}
-
-int copyOut(const Snapshot *snapshot, _tag_iscsi_snapshot_ *out)
-{
-    return copyRecord(snapshot ? &snapshot->record : nullptr, out, NORV_ERR_NO_SUCH_SNAPSHOT);
+    return firstOf(model().snapshots,
+                   [&](const auto &record) { return record.lid == lid && strcmp(record.name, name) == 0; });
 }
 
 bool isAsked(const _tag_iscsi_snapshot_query_ &query, const _tag_iscsi_snapshot_ &record)
@@ -52,12 +38,12 @@ int freeNumber(int lid)
     return number;
 }
 
-int setLoaded(const _tag_iscsi_snapshot_ *record, bool is_loaded)
+int setLoaded(const char *name, const _tag_iscsi_snapshot_ &record, bool is_loaded)
 {
-    Snapshot *snapshot = byUUID(record->uuid);
-    if (!snapshot)
-        return NORV_ERR_NO_SUCH_SNAPSHOT;
-    const uint32_t trash = record->flags & NORV_SNAPSHOT_TRASH;
+    Snapshot *snapshot = byUUID(record.uuid);
+    if (auto failure = calledOn(snapshot, name, record.uuid, record.flags))
+        return *failure;
+    const uint32_t trash = record.flags & NORV_SNAPSHOT_TRASH;
     if (is_loaded && !trash && snapshot->record.flags & NORV_SNAPSHOT_TRASH)
         return NORV_ERR_SNAPSHOT_NOT_LOADED;
     snapshot->record.flags = is_loaded ? snapshot->record.flags & ~trash : snapshot->record.flags | trash;
@@ -67,29 +53,29 @@ int setLoaded(const _tag_iscsi_snapshot_ *record, bool is_loaded)
     return 0;
 }
 
-int waitFor(bool is_locked)
+/// Waits for an object's lock.
+template <class Object>
+int waitFor(const Object *object, const char *name, const char *uuid, int limit)
 {
+    if (auto failure = calledOn(object, name, uuid, limit))
+        return *failure;
     constexpr int PATIENCE = 10000;
     pollfd held{model().held_by, POLLIN, 0}; // poll() passes over a descriptor of -1
     if (model().held_by >= 0 && poll(&held, 1, PATIENCE) != 1)
         return NORV_ERR_TIMEOUT;
-    return is_locked ? NORV_ERR_TIMEOUT : 0;
+    return object->is_locked ? NORV_ERR_TIMEOUT : 0;
 }
 
 } // namespace
 
 int NORViSCSISnapshotConfGetByUUID(const char *uuid, _tag_iscsi_snapshot_ *snapshot)
 {
-    if (auto failure = called(__func__, uuid))
-        return *failure;
-    return copyOut(byUUID(uuid), snapshot);
+    return answerRecord(byUUID(uuid), snapshot, __func__, uuid);
 }
 
 int NORViSCSISnapshotConfGetByLIDAndName(int lid, const char *name, _tag_iscsi_snapshot_ *snapshot)
 {
-    if (auto failure = called(__func__, lid, name))
-        return *failure;
-    return copyOut(byName(lid, name), snapshot);
+    return answerRecord(byName(lid, name), snapshot, __func__, lid, name);
 }
 
 int NORViSCSISnapshotConfLoad(const _tag_iscsi_snapshot_query_ *query, _tag_iscsi_snapshot_list_ *list)
@@ -116,22 +102,16 @@ int NORViSCSISnapshotConfLoad(const _tag_iscsi_snapshot_query_ *query, _tag_iscs
 
 int NORViSCSIIsSnapshotLocked(const _tag_iscsi_snapshot_ *snapshot, bool *locked)
 {
-    if (auto failure = called(__func__, snapshot->uuid))
-        return *failure;
     const Snapshot *known = byUUID(snapshot->uuid);
-    if (!known)
-        return NORV_ERR_NO_SUCH_SNAPSHOT;
+    NOTE_CALL_ON(known, snapshot->uuid);
     *locked = answerOf(__func__, known->is_locked) != 0;
     return 0;
 }
 
 int NORViSCSISnapshotLockedAppKeysGet(const _tag_iscsi_snapshot_ *snapshot, NLIBC_SZ_LIST *keys)
 {
-    if (auto failure = called(__func__, snapshot->uuid))
-        return *failure;
     const Snapshot *known = byUUID(snapshot->uuid);
-    if (!known)
-        return NORV_ERR_NO_SUCH_SNAPSHOT;
+    NOTE_CALL_ON(known, snapshot->uuid);
     for (const auto &key : known->app_keys) {
         if (pushText(*keys, key) < 0)
             return NORV_ERR_OUT_OF_MEMORY;
@@ -141,11 +121,8 @@ int NORViSCSISnapshotLockedAppKeysGet(const _tag_iscsi_snapshot_ *snapshot, NLIB
 
 int NORViSCSISnapshotLockByAppKey(const _tag_iscsi_snapshot_ *snapshot, const char *key)
 {
-    if (auto failure = called(__func__, snapshot->uuid, key))
-        return *failure;
     Snapshot *known = byUUID(snapshot->uuid);
-    if (!known)
-        return NORV_ERR_NO_SUCH_SNAPSHOT;
+    NOTE_CALL_ON(known, snapshot->uuid, key);
     if (*key == '\0')
         return NORV_ERR_APP_KEY;
     known->app_keys.insert(key);
@@ -154,19 +131,15 @@ int NORViSCSISnapshotLockByAppKey(const _tag_iscsi_snapshot_ *snapshot, const ch
 
 int NORViSCSISnapshotUnlockByAppKey(const _tag_iscsi_snapshot_ *snapshot, const char *key)
 {
-    if (auto failure = called(__func__, snapshot->uuid, key))
-        return *failure;
     Snapshot *known = byUUID(snapshot->uuid);
-    if (!known)
-        return NORV_ERR_NO_SUCH_SNAPSHOT;
+    NOTE_CALL_ON(known, snapshot->uuid, key);
     known->app_keys.erase(key);
     return 0;
 }
 
 int NORViSCSIUnusedSnapshotNameFind(int lid, char *name, int size)
 {
-    if (auto failure = called(__func__, lid, size))
-        return *failure;
+    NOTE_CALL(lid, size);
     int number = 1;
     do
         snprintf(name, static_cast<size_t>(size), "auto-%d", number++);
@@ -176,10 +149,8 @@ int NORViSCSIUnusedSnapshotNameFind(int lid, char *name, int size)
 
 int NORViSCSISnapshotCreate(const _tag_iscsi_lun_ *lun, _tag_iscsi_snapshot_ *snapshot)
 {
-    if (auto failure =
-            called(__func__, lun->uuid, snapshot->name, snapshot->desc, snapshot->taken_by, snapshot->snap_time,
-                   snapshot->flags, int(snapshot->app_consistent), int(snapshot->user_locked)))
-        return *failure;
+    NOTE_CALL(lun->uuid, snapshot->name, snapshot->desc, snapshot->taken_by, snapshot->snap_time, snapshot->flags,
+              int(snapshot->app_consistent), int(snapshot->user_locked));
     const LUN *known = findLUN(lun->uuid);
     if (!known)
         return NORV_ERR_NO_SUCH_LUN;
@@ -209,11 +180,8 @@ int NORViSCSISnapshotCreate(const _tag_iscsi_lun_ *lun, _tag_iscsi_snapshot_ *sn
 
 int NORViSCSISnapshotDelete(const _tag_iscsi_snapshot_ *snapshot, const char *who)
 {
-    if (auto failure = called(__func__, snapshot->uuid, who))
-        return *failure;
     const Snapshot *known = byUUID(snapshot->uuid);
-    if (!known)
-        return NORV_ERR_NO_SUCH_SNAPSHOT;
+    NOTE_CALL_ON(known, snapshot->uuid, who);
     if (known->record.user_locked)
         return NORV_ERR_SNAPSHOT_USER_LOCKED;
     if (known->is_locked || !known->app_keys.empty())
@@ -224,8 +192,7 @@ int NORViSCSISnapshotDelete(const _tag_iscsi_snapshot_ *snapshot, const char *wh
 
 int NORViSCSISnapshotRestore(const _tag_iscsi_snapshot_ *snapshot, const _tag_iscsi_lun_ *lun)
 {
-    if (auto failure = called(__func__, snapshot->uuid, lun->uuid))
-        return *failure;
+    NOTE_CALL(snapshot->uuid, lun->uuid);
     const Snapshot *known = byUUID(snapshot->uuid);
     LUN *restored = findLUN(lun->uuid);
     if (!known || !restored || known->record.lid != restored->record.lid)
@@ -238,63 +205,44 @@ int NORViSCSISnapshotRestore(const _tag_iscsi_snapshot_ *snapshot, const _tag_is
 
 int NORViSCSISnapshotLoad(const _tag_iscsi_snapshot_ *snapshot)
 {
-    if (auto failure = called(__func__, snapshot->uuid, snapshot->flags))
-        return *failure;
-    return setLoaded(snapshot, true);
+    return setLoaded(__func__, *snapshot, true);
 }
 
 int NORViSCSISnapshotUnload(const _tag_iscsi_snapshot_ *snapshot)
 {
-    if (auto failure = called(__func__, snapshot->uuid, snapshot->flags))
-        return *failure;
-    return setLoaded(snapshot, false);
+    return setLoaded(__func__, *snapshot, false);
 }
 
 int NORViSCSISnapshotClone(const _tag_iscsi_snapshot_ *snapshot, _tag_iscsi_lun_ *clone)
 {
-    if (auto failure = called(__func__, snapshot->uuid, clone->name, clone->type, clone->location, clone->extent_size))
-        return *failure;
     const Snapshot *known = byUUID(snapshot->uuid);
-    if (!known)
-        return NORV_ERR_NO_SUCH_SNAPSHOT;
+    NOTE_CALL_ON(known, snapshot->uuid, clone->name, clone->type, clone->location, clone->extent_size);
     clone->size = known->record.total_size;
     return createLUN(*clone);
 }
 
 int NORViSCSILunClone(const _tag_iscsi_lun_ *source, _tag_iscsi_lun_ *clone)
 {
-    if (auto failure = called(__func__, source->uuid, clone->name, clone->type, clone->location, clone->extent_size))
-        return *failure;
     const LUN *known = findLUN(source->uuid);
-    if (!known)
-        return NORV_ERR_NO_SUCH_LUN;
+    NOTE_CALL_ON(known, source->uuid, clone->name, clone->type, clone->location, clone->extent_size);
     clone->size = known->record.size;
     return createLUN(*clone);
 }
 
 int NORViSCSILunWaitUntilUnlock(const _tag_iscsi_lun_ *lun, int limit)
 {
-    if (auto failure = called(__func__, lun->uuid, limit))
-        return *failure;
-    const LUN *known = findLUN(lun->uuid);
-    return known ? waitFor(known->is_locked) : NORV_ERR_NO_SUCH_LUN;
+    return waitFor(findLUN(lun->uuid), __func__, lun->uuid, limit);
 }
 
 int NORViSCSISnapshotWaitUntilUnlock(const _tag_iscsi_snapshot_ *snapshot, int limit)
 {
-    if (auto failure = called(__func__, snapshot->uuid, limit))
-        return *failure;
-    const Snapshot *known = byUUID(snapshot->uuid);
-    return known ? waitFor(known->is_locked) : NORV_ERR_NO_SUCH_SNAPSHOT;
+    return waitFor(byUUID(snapshot->uuid), __func__, snapshot->uuid, limit);
 }
 
 int NORViSCSISnapshotExport(const _tag_iscsi_snapshot_ *snapshot, const char *destination)
 {
-    if (auto failure = called(__func__, snapshot->uuid, destination))
-        return *failure;
     const Snapshot *known = byUUID(snapshot->uuid);
-    if (!known)
-        return NORV_ERR_NO_SUCH_SNAPSHOT;
+    NOTE_CALL_ON(known, snapshot->uuid, destination);
     if (*destination != '/')
         return NORV_ERR_EXPORT_LOCATION;
     if (model().exports.count(destination) != 0)
@@ -310,11 +258,8 @@ int NORViSCSISnapshotExport(const _tag_iscsi_snapshot_ *snapshot, const char *de
 
 int NORViSCSISnapshotExportCancel(const _tag_iscsi_snapshot_ *snapshot)
 {
-    if (auto failure = called(__func__, snapshot->uuid))
-        return *failure;
     Snapshot *known = byUUID(snapshot->uuid);
-    if (!known)
-        return NORV_ERR_NO_SUCH_SNAPSHOT;
+    NOTE_CALL_ON(known, snapshot->uuid);
     if (!known->is_locked)
         return NORV_ERR_NOT_EXPORTING;
     known->is_locked = false;
@@ -323,11 +268,8 @@ int NORViSCSISnapshotExportCancel(const _tag_iscsi_snapshot_ *snapshot)
 
 int NORViSCSILunImport(const _tag_iscsi_lun_ *lun, const char *source)
 {
-    if (auto failure = called(__func__, lun->uuid, source))
-        return *failure;
     const LUN *known = findLUN(lun->uuid);
-    if (!known)
-        return NORV_ERR_NO_SUCH_LUN;
+    NOTE_CALL_ON(known, lun->uuid, source);
     if (model().exports.count(source) == 0)
         return NORV_ERR_FILE_NOT_FOUND;
     return known->is_locked ? NORV_ERR_LUN_LOCKED : 0;
@@ -335,11 +277,8 @@ int NORViSCSILunImport(const _tag_iscsi_lun_ *lun, const char *source)
 
 int NORViSCSILunImportCancel(const _tag_iscsi_lun_ *lun)
 {
-    if (auto failure = called(__func__, lun->uuid))
-        return *failure;
     LUN *known = findLUN(lun->uuid);
-    if (!known)
-        return NORV_ERR_NO_SUCH_LUN;
+    NOTE_CALL_ON(known, lun->uuid);
     if (!known->is_locked)
         return NORV_ERR_NOT_IMPORTING;
     known->is_locked = false;
@@ -348,8 +287,7 @@ int NORViSCSILunImportCancel(const _tag_iscsi_lun_ *lun)
 
 int NORViSCSISnapshotExportConfigGet(const char *directory, _tag_iscsi_export_config_ *config)
 {
-    if (auto failure = called(__func__, directory))
-        return *failure;
-    const auto found = model().exports.find(directory);
-    return copyRecord(found == model().exports.end() ? nullptr : &found->second, config, NORV_ERR_FILE_NOT_FOUND);
+    NOTE_CALL(directory);
+    const auto *found = valueOf(model().exports, directory);
+    return found ? copyRecord(*found, config) : NORV_ERR_FILE_NOT_FOUND;
 }

@@ -55,72 +55,61 @@ void addMappings(Answer &answer, int lid)
     }
 }
 
+/// A target for each mapping of the LUN.
 void addTargetsOfLUN(Answer &answer, int lid)
 {
-    for (const auto &[tid, target] : model().targets) {
-        for (const auto &mapping : model().mappings) {
-            if (mapping.tid == tid && mapping.lid == lid) {
-                answer.target_list.push_back(target.record);
-                answer.mapping_list.push_back(mapping);
-            }
-        }
-    }
+    addMappings(answer, lid);
+    auto &mappings = answer.mapping_list;
+    mappings.erase(std::remove_if(mappings.begin(), mappings.end(),
+                                  [](const auto &mapping) { return model().targets.count(mapping.tid) == 0; }),
+                   mappings.end());
+    std::stable_sort(mappings.begin(), mappings.end(), [](const auto &a, const auto &b) { return a.tid < b.tid; });
+    for (const auto &mapping : mappings)
+        answer.target_list.push_back(model().targets.at(mapping.tid).record);
 }
 
-bool answerTargets(const _tag_iscsi_conf_query_ &query, Answer &answer)
+/// Fills the answer; says which field of the query is read, and nothing for a kind that is none.
+std::optional<std::string> answerFrom(const _tag_iscsi_conf_query_ &query, Answer &answer)
 {
     switch (query.kind) {
     case NORV_CONF_TARGET_BY_ID:
         addTargets(answer, [&](const auto &record) { return record.tid == query.tid; });
-        return true;
+        return joined("", query.tid);
     case NORV_CONF_TARGET_BY_NAME:
         addTargets(answer, [&](const auto &record) { return strcmp(record.name, query.name) == 0; });
-        return true;
+        return joined("", query.name);
     case NORV_CONF_ALL_TARGETS:
         addTargets(answer, [](const auto &) { return true; });
-        return true;
-    default:
-        return false;
-    }
-}
-
-bool answerMappings(const _tag_iscsi_conf_query_ &query, Answer &answer)
-{
-    switch (query.kind) {
+        return "";
     case NORV_CONF_TARGETS_OF_LUN:
         addTargetsOfLUN(answer, query.lun->lid);
-        return true;
+        return joined("", query.lun->uuid);
     case NORV_CONF_MAPPINGS_OF_LUN:
         addMappings(answer, query.lid);
-        return true;
+        return joined("", query.lid);
     default:
-        return false;
+        return std::nullopt;
     }
 }
 
-/// The kind, and the field that it reads.
-std::string describe(const _tag_iscsi_conf_query_ &query)
+int answerQuery(const char *name, const _tag_iscsi_conf_query_ &query, _tag_iscsi_conf_ **conf)
 {
+    *conf = nullptr;
     char kind[8];
     snprintf(kind, sizeof(kind), "0x%04X", query.kind);
-    switch (query.kind) {
-    case NORV_CONF_TARGET_BY_ID:
-        return joined(kind, query.tid);
-    case NORV_CONF_TARGET_BY_NAME:
-        return joined(kind, query.name);
-    case NORV_CONF_TARGETS_OF_LUN:
-        return joined(kind, query.lun->uuid);
-    case NORV_CONF_MAPPINGS_OF_LUN:
-        return joined(kind, query.lid);
-    default:
-        return kind;
-    }
+    auto answer = std::make_unique<Answer>();
+    const auto field = answerFrom(query, *answer);
+    if (auto failure = called(name, kind + field.value_or("")))
+        return *failure;
+    if (!field)
+        return NORV_ERR_BAD_PARAMETER;
+    *conf = answer.release()->linked();
+    return 0;
 }
 
 Target *byID(int tid)
 {
-    const auto found = model().targets.find(tid);
-    return found == model().targets.end() ? nullptr : &found->second;
+    return valueOf(model().targets, tid);
 }
 
 int judge(const _tag_iscsi_target_ &target)
@@ -149,14 +138,7 @@ int fake::unfreedAnswers()
 
 int NORViSCSIConfGet(const _tag_iscsi_conf_query_ *query, _tag_iscsi_conf_ **conf)
 {
-    *conf = nullptr;
-    if (auto failure = called(__func__, describe(*query)))
-        return *failure;
-    auto answer = std::make_unique<Answer>();
-    if (!answerTargets(*query, *answer) && !answerMappings(*query, *answer))
-        return NORV_ERR_BAD_PARAMETER;
-    *conf = answer.release()->linked();
-    return 0;
+    return answerQuery(__func__, *query, conf);
 }
 
 void NORViSCSIConfFree(_tag_iscsi_conf_ *conf)
@@ -166,20 +148,12 @@ void NORViSCSIConfFree(_tag_iscsi_conf_ *conf)
 
 int NORViSCSIConfTargetLoad(const _tag_iscsi_conf_query_ *query, _tag_iscsi_conf_ **conf)
 {
-    *conf = nullptr;
-    if (auto failure = called(__func__, describe(*query)))
-        return *failure;
-    auto answer = std::make_unique<Answer>();
-    if (!answerTargets(*query, *answer))
-        return NORV_ERR_BAD_PARAMETER;
-    *conf = answer.release()->linked();
-    return 0;
+    return answerQuery(__func__, *query, conf);
 }
 
 int NORViSCSITargetCreate(_tag_iscsi_target_ *target)
 {
-    if (auto failure = called(__func__, target->name, target->iqn, target->enabled ? "enabled" : "disabled"))
-        return *failure;
+    NOTE_CALL(target->name, target->iqn, target->enabled ? "enabled" : "disabled");
     if (int err = judge(*target))
         return err;
     int tid = 1;
@@ -194,8 +168,7 @@ int NORViSCSITargetCreate(_tag_iscsi_target_ *target)
 
 int NORViSCSITargetRemove(const _tag_iscsi_target_ *target)
 {
-    if (auto failure = called(__func__, target->tid))
-        return *failure;
+    NOTE_CALL(target->tid);
     if (model().targets.erase(target->tid) == 0)
         return NORV_ERR_NO_SUCH_TARGET;
     auto &mappings = model().mappings;
@@ -207,11 +180,8 @@ int NORViSCSITargetRemove(const _tag_iscsi_target_ *target)
 
 int NORViSCSITargetEnable(_tag_iscsi_target_ *target)
 {
-    if (auto failure = called(__func__, target->tid))
-        return *failure;
     Target *known = byID(target->tid);
-    if (!known)
-        return NORV_ERR_NO_SUCH_TARGET;
+    NOTE_CALL_ON(known, target->tid);
     known->record.enabled = target->enabled = 1;
     return 0;
 }

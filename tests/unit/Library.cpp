@@ -2,6 +2,7 @@
 
 #include <json/reader.h>
 
+#include <algorithm>
 #include <cstdio>
 #include <cstdlib>
 #include <ctime>
@@ -97,12 +98,15 @@ Lines logged()
     return lines;
 }
 
-Lines called()
+Lines called(const Lines &prefixes)
 {
     waitForWorkers();
     Lines lines;
-    for (const auto &call : fake::calls())
-        lines.push_back(call.name + "(" + call.arguments + ")");
+    for (const auto &call : fake::calls()) {
+        const auto begins = [&](const std::string &prefix) { return call.name.rfind(prefix, 0) == 0; };
+        if (std::any_of(prefixes.begin(), prefixes.end(), begins))
+            lines.push_back(call.name + "(" + call.arguments + ")");
+    }
     fake::forgetCalls();
     return lines;
 }

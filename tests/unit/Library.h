@@ -7,7 +7,6 @@
 #include <gtest/gtest.h>
 #include <json/value.h>
 
-#include <cstring>
 #include <string>
 #include <vector>
 
@@ -37,8 +36,9 @@ protected:
 /// failure; addresses stand as {addresses}.
 Lines logged();
 
-/// Platform calls since the last call, once detached workers have ended, as "Name(arguments)".
-Lines called();
+/// Platform calls since the last call, once detached workers have ended, as "Name(arguments)"; those whose names begin
+/// with one of `prefixes`.
+Lines called(const Lines &prefixes = {""});
 
 std::string uuidOf(int lid);
 
@@ -68,20 +68,6 @@ const char *const PEER_NODE = "11111111-0000-4000-8000-000000000002";
 const char *const KEPT_ROD_KEY = "kept-rod-key";
 const char *const PEER_SESSION = "peer-session";
 void addNodes();
-
-/// A field of an SDK record, by its place.
-template <class Value>
-Value at(const void *record, size_t offset)
-{
-    Value value;
-    memcpy(&value, static_cast<const char *>(record) + offset, sizeof(value));
-    return value;
-}
-
-inline const char *textAt(const void *record, size_t offset)
-{
-    return static_cast<const char *>(record) + offset;
-}
 
 Json::Value parsed(const std::string &json);
 

@@ -4,6 +4,7 @@
 
 #include <cstring>
 #include <string>
+#include <utility>
 
 namespace {
 
@@ -71,29 +72,12 @@ TEST(ErrorCodes, OwnCodesHaveTheirTexts)
 
 TEST(ErrorCodes, OtherCodesAreErrnoValues)
 {
-    const struct {
-        int code, number;
-    } cases[] = {
-        {0, 0},
-        {2, 2},
-        {-1, 1},
-        {-2, 2},
-        {-255, 255},
-        {-256, -256},
-        {INT32_MIN, INT32_MIN},
-        {INT32_MAX, INT32_MAX},
-        {18989999, 18989999},
-        {18990058, 18990058},
-        {18990199, 18990199},
-        {18990214, 18990214},
-        {18990596, 18990596},
-        {18991010, 18991010},
-        {18991122, 18991122},
-    };
-    for (const auto &c : cases) {
-        const std::string expected = strerror(c.number);
-        EXPECT_EQ(ISCSI::ErrorCodeToString(c.code), expected) << c.code;
-    }
+    const std::pair<int, int> cases[] = {
+        {0, 0}, {2, 2}, {-1, 1}, {-2, 2}, {-255, 255}, {-256, -256}, {INT32_MIN, INT32_MIN}, {INT32_MAX, INT32_MAX}};
+    for (const auto &[code, number] : cases)
+        EXPECT_EQ(ISCSI::ErrorCodeToString(code), std::string(strerror(number))) << code;
+    for (int beside_a_range : {18989999, 18990058, 18990199, 18990214, 18990596, 18991010, 18991122})
+        EXPECT_EQ(ISCSI::ErrorCodeToString(beside_a_range), std::string(strerror(beside_a_range)));
 }
 
 } // namespace

@@ -44,25 +44,17 @@ TEST_F(LUNState, ARecordWithoutALUNIsFilledFirst)
 
 TEST_F(LUNState, LocksAndMappings)
 {
-    addLUN(3, "vol1").is_locked = true;
-    EXPECT_EQ(lun.loadIsActionLocked(record), 0);
-    EXPECT_TRUE(lun.is_action_locked);
-    fake::model().luns.at(3).is_locked = false;
-    EXPECT_EQ(lun.loadIsActionLocked(record), 0);
-    EXPECT_FALSE(lun.is_action_locked);
-
     // Only target IDs 1 to 256 are targets; the others are the platform's own entries.
-    addMapping(0, 3);
-    addMapping(257, 3);
-    addMapping(-1, 3);
+    addLUN(3, "vol1");
     addMapping(1, 4);
-    lun.is_mapped = true;
-    EXPECT_EQ(lun.loadIsMapped(record), 0);
-    EXPECT_FALSE(lun.is_mapped);
-    for (int tid : {1, 256}) {
+    for (const auto &[tid, expected] :
+         std::map<int, bool>{{0, false}, {257, false}, {-1, false}, {1, true}, {256, true}}) {
         addMapping(tid, 3);
+        fake::model().luns.at(3).is_locked = expected;
         EXPECT_EQ(lun.loadIsMapped(record), 0);
-        EXPECT_TRUE(lun.is_mapped);
+        EXPECT_EQ(lun.loadIsActionLocked(record), 0);
+        EXPECT_EQ(lun.is_mapped, expected) << tid;
+        EXPECT_EQ(lun.is_action_locked, expected);
         fake::model().mappings.pop_back();
     }
 }
@@ -106,10 +98,6 @@ TEST_F(LUNState, StatusOfAnIdleLUNIsItsHealth)
         EXPECT_EQ(lun.loadStatus(record), 0);
         EXPECT_EQ(lun.status, c.status) << c.checker << ' ' << c.progress << ' ' << c.health;
     }
-    called();
-    fake::model().exit_status = 0;
-    EXPECT_EQ(lun.loadStatus(record), 0);
-    EXPECT_EQ(called().front(), "NLIBCExec(/usr/norv/sbin/epck, --vaaick, nolog)");
 }
 
 TEST_F(LUNState, MapFilesAreNamedByTypeAndPlace)
@@ -245,20 +233,15 @@ TEST_F(AllocatedSize, IsTheBlocksOfTheLUNsFiles)
     }
 }
 
-TEST_F(AllocatedSize, IsNeverMoreThanTheSize)
+TEST_F(AllocatedSize, IsNeverMoreThanTheSizeAndNeedsAFile)
 {
-    write("@iSCSITrg/iSCSI_3_vol1_000", 100000);
     haveLUN(NORV_LUN_TYPE_THIN, 4608);
-    EXPECT_EQ(lun.loadFromConfig(record, ISCSILUNInfo::LOAD_ALLOCATED_SIZE), 0);
-    EXPECT_EQ(lun.allocated_size, 4608u);
-}
-
-TEST_F(AllocatedSize, NoFileIsAFailure)
-{
-    haveLUN(NORV_LUN_TYPE_FILE);
     write("@EP_trash/iSCSI_3_vol1_000", 1);
     EXPECT_EQ(lun.loadAllocatedSize(record), 18990044);
     EXPECT_EQ(logged(), Lines{"loadAllocatedSize: Failed to copy file path"});
+    write("@iSCSITrg/iSCSI_3_vol1_000", 100000);
+    EXPECT_EQ(lun.loadFromConfig(record, ISCSILUNInfo::LOAD_ALLOCATED_SIZE), 0);
+    EXPECT_EQ(lun.allocated_size, 4608u);
 }
 
 TEST_F(AllocatedSize, OfOtherTypesComesFromTheRecord)

@@ -1,6 +1,7 @@
 #include "iscsiwebapi/ISCSISnapshotInfo.h"
-#include "tests/unit/Library.h"
+#include "tests/unit/BadJson.h"
 
+#include <algorithm>
 #include <cstring>
 #include <limits>
 
@@ -11,12 +12,6 @@ using ISCSI::ISCSISnapshotInfo;
 
 constexpr int ACTION_LOCK = 1, APP_KEYS = 2;
 const std::string UUID = snapshotUUIDOf(7, 3);
-
-const char *const NO_FIELD =
-    "uuid:  ,snapshot_id: 0 ,parent_lun_id: 0 ,total_size: 0 (0bytes) ,mapped_size: 0 (0bytes)"
-    " ,is_action_locked: false ,is_app_consistent: false ,is_user_locked: false ,name:  ,status:  ,description:"
-    "  ,root_path:  ,taken_by:  ,version:  ,create_time: Thu Jan 01 00:00:00 UTC 1970"
-    " ,snapshot_time: Thu Jan 01 00:00:00 UTC 1970 ,locked_app_keys: ";
 
 const char *const EVERY_FIELD =
     "uuid: u ,snapshot_id: 3 ,parent_lun_id: 7 ,total_size: 1073741824 (1GB) ,mapped_size: 1536 (1KB,512bytes)"
@@ -50,40 +45,21 @@ protected:
 TEST_F(SnapshotRecord, RendersAsText)
 {
     EXPECT_EQ(everyField().toString(), EVERY_FIELD);
-    EXPECT_EQ(ISCSISnapshotInfo().toString(), NO_FIELD);
-    snapshot = ISCSISnapshotInfo("u");
-    EXPECT_EQ(snapshot.uuid, "u");
-    snapshot.uuid.clear();
-    EXPECT_EQ(snapshot.toString(), NO_FIELD);
     snapshot.create_time = std::numeric_limits<long>::max();
     EXPECT_NE(snapshot.toString().find(" ,create_time: "), std::string::npos) << "absurd times still render";
 }
 
-TEST_F(SnapshotRecord, ReadsTheSDKRecordAtItsOffsets)
+TEST_F(SnapshotRecord, IsReadFromTheSDKs)
 {
-    _tag_iscsi_snapshot_ record{};
-    char *bytes = reinterpret_cast<char *>(&record);
-    const auto putNumber = [&](size_t offset, auto value) { memcpy(bytes + offset, &value, sizeof(value)); };
-    putNumber(0, int32_t(7));
-    putNumber(4, int32_t(3));
-    putNumber(16, uint64_t(GIB));
-    putNumber(24, uint64_t(1536));
-    putNumber(32, int32_t(EPOCH));
-    putNumber(36, int32_t(EPOCH + 1));
-    putNumber(41, uint8_t(1));
-    strcpy(bytes + 42, "daily");
-    strcpy(bytes + 298, "Healthy");
-    strcpy(bytes + 330, "a note");
-    strcpy(bytes + 1354, "/volume1");
-    strcpy(bytes + 5449, "alice");
-    strcpy(bytes + 5481, "u");
-    strcpy(bytes + 5518, "v");
-    snapshot = ISCSISnapshotInfo(record);
-    EXPECT_FALSE(snapshot.is_action_locked);
-    EXPECT_TRUE(snapshot.locked_app_keys.empty());
-    snapshot.is_action_locked = true;
-    snapshot.locked_app_keys = {"a", "b"};
-    EXPECT_EQ(snapshot.toString(), EVERY_FIELD);
+    auto &record = addSnapshot(7, 3, "daily").record;
+    EXPECT_EQ(ISCSISnapshotInfo(record).toString(),
+              "uuid: " + UUID +
+                  " ,snapshot_id: 3 ,parent_lun_id: 7 ,total_size: 1073741824 (1GB) ,mapped_size: 65536 (64KB)"
+                  " ,is_action_locked: false ,is_app_consistent: true ,is_user_locked: false ,name: daily"
+                  " ,status: Healthy ,description: before the move ,root_path: /volume1 ,taken_by: alice ,version: " +
+                  snapshotUUIDOf(7, 9999) +
+                  " ,create_time: Sat Feb 14 00:32:30 UTC 2009 ,snapshot_time: Sat Feb 14 00:31:33 UTC 2009"
+                  " ,locked_app_keys: ");
 
     // A platform that forgot a NUL must not make us read on.
     memset(record.name, 'n', sizeof(record.name));
@@ -146,44 +122,15 @@ TEST_F(SnapshotRecord, JsonIsReadAndItsKeysAreMerged)
 
 TEST_F(SnapshotRecord, BadJsonChangesNothing)
 {
-    const Json::Value good = parsed(JSON);
     snapshot = everyField();
-    const auto refuses = [&](const Json::Value &in, const std::string &what) {
-        EXPECT_EQ(snapshot.loadFromJson(in), 18990201) << what;
-        EXPECT_EQ(logged(), Lines{"loadFromJson: Failed to get snapshot info from Json."}) << what;
-        EXPECT_EQ(snapshot.toString(), EVERY_FIELD) << what;
-    };
-    for (const char *json : {"null", "[]", "\"text\"", "7", "{}"})
-        refuses(parsed(json), json);
-
-    const Lines ids = {"snapshot_id", "parent_lun_id", "create_time", "snapshot_time"};
-    const Lines sizes = {"total_size", "mapped_size"};
-    const Lines flags = {"is_app_consistent", "is_user_locked"};
-    const Lines texts = {"name", "status", "description", "root_path", "taken_by", "uuid", "version"};
-    const struct {
-        Lines keys;
-        bool is_required;
-        Lines wrong;
-    } kinds[] = {
-        {ids, true, {"null", "\"3\"", "true", "[3]", "3.5", "2147483648", "-2147483649"}},
-        {sizes, true, {"null", "\"3\"", "{}", "1e99", "-1", "18446744073709551616"}},
-        {flags, true, {"null", "\"true\"", "[]", "1.5"}},
-        {texts, true, {"null", "3", "false", "[\"a\"]", "\"a\\u0000b\""}},
-        {{"is_action_locked"}, false, {"null", "\"false\"", "[]"}},
-        {{"locked_app_keys"}, false, {"[3]", "[\"c\", null]", "[[\"c\"]]", "[\"c\\u0000d\"]"}},
-    };
-    for (const auto &kind : kinds) {
-        for (const auto &key : kind.keys) {
-            Json::Value in = good;
-            in.removeMember(key);
-            if (kind.is_required)
-                refuses(in, "no " + key);
-            for (const auto &value : kind.wrong) {
-                in[key] = parsed(value);
-                refuses(in, key + ": " + value);
-            }
-        }
-    }
+    expectBadJsonRefused(
+        snapshot, parsed(JSON), {"loadFromJson: Failed to get snapshot info from Json."},
+        {{{"snapshot_id", "parent_lun_id", "create_time", "snapshot_time"}, true, NO_INT},
+         {{"total_size", "mapped_size"}, true, NO_SIZE},
+         {{"is_app_consistent", "is_user_locked"}, true, NO_FLAG},
+         {{"name", "status", "description", "root_path", "taken_by", "uuid", "version"}, true, NO_TEXT},
+         {{"is_action_locked"}, false, NO_FLAG},
+         {{"locked_app_keys"}, false, {"[3]", "[\"c\", null]", "[[\"c\"]]", "[\"c\\u0000d\"]"}}});
 }
 
 // Loading and locks.
@@ -191,33 +138,22 @@ TEST_F(SnapshotRecord, BadJsonChangesNothing)
 TEST_F(SnapshotRecord, LoadsWhatTheFlagsAskFor)
 {
     addDaily();
-    const std::string keys_of = "NORViSCSISnapshotLockedAppKeysGet(" + UUID + ")";
-    const struct {
-        int flags;
-        bool is_locked;
-        std::set<std::string> keys;
-        Lines calls;
-    } cases[] = {
-        {0, false, {"old"}, {loaded}},
-        {ACTION_LOCK, true, {"old"}, {loaded, asked_lock}},
-        {APP_KEYS,
-         false,
-         {"a", "b"},
-         {loaded, "NLIBCSzListAlloc(512)", keys_of, "NLIBCSzListGet(0)", "NLIBCSzListGet(1)"}},
-        {3,
-         true,
-         {"a", "b"},
-         {loaded, asked_lock, "NLIBCSzListAlloc(512)", keys_of, "NLIBCSzListGet(0)", "NLIBCSzListGet(1)"}},
-    };
-    for (const auto &c : cases) {
+    const Lines keys = {"NLIBCSzListAlloc(512)", "NORViSCSISnapshotLockedAppKeysGet(" + UUID + ")", "NLIBCSzListGet(0)",
+                        "NLIBCSzListGet(1)"};
+    for (int flags = 0; flags <= (ACTION_LOCK | APP_KEYS); ++flags) {
+        Lines expected = {loaded};
+        if (flags & ACTION_LOCK)
+            expected.push_back(asked_lock);
+        if (flags & APP_KEYS)
+            expected.insert(expected.end(), keys.begin(), keys.end());
         snapshot = ISCSISnapshotInfo(UUID);
         snapshot.locked_app_keys = {"old"};
-        EXPECT_EQ(snapshot.loadFromConfig(c.flags), 0);
-        EXPECT_EQ(called(), c.calls) << c.flags;
-        EXPECT_EQ(snapshot.name, "daily");
+        EXPECT_EQ(snapshot.loadFromConfig(flags), 0);
+        EXPECT_EQ(called(), expected) << flags;
         EXPECT_EQ(snapshot.version, snapshotUUIDOf(7, 9999));
-        EXPECT_EQ(snapshot.is_action_locked, c.is_locked);
-        EXPECT_EQ(snapshot.locked_app_keys, c.keys);
+        EXPECT_EQ(snapshot.is_action_locked, (flags & ACTION_LOCK) != 0);
+        EXPECT_EQ(snapshot.locked_app_keys,
+                  (flags & APP_KEYS ? std::set<std::string>{"a", "b"} : std::set<std::string>{"old"}));
     }
 
     addSnapshot(7, 4, "other").record.uuid[0] = '\0'; // a platform that leaves the UUID out
@@ -258,11 +194,10 @@ TEST_F(SnapshotRecord, AppKeysLockAndUnlock)
     EXPECT_EQ(snapshot.unlockSnapshotByAppKey("backup"), 0);
     EXPECT_EQ(keys, std::set<std::string>{longest});
 
-    const Lines refused = {"StringCopy: Failed to copy string: " + longest + "k"};
     EXPECT_EQ(snapshot.lockSnapshotByAppKey(longest + "k"), 18990025);
-    EXPECT_EQ(logged(), (Lines{refused[0], "lockSnapshotByAppKey: Failed to copy app key: " + longest + "k."}));
+    EXPECT_EQ(logged().back(), "lockSnapshotByAppKey: Failed to copy app key: " + longest + "k.");
     EXPECT_EQ(snapshot.unlockSnapshotByAppKey(longest + "k"), 18990025);
-    EXPECT_EQ(logged(), (Lines{refused[0], "unlockSnapshotByAppKey: Failed to copy app key: " + longest + "k."}));
+    EXPECT_EQ(logged().back(), "unlockSnapshotByAppKey: Failed to copy app key: " + longest + "k.");
     EXPECT_EQ(keys.size(), 1u);
 }
 
@@ -300,35 +235,94 @@ TEST_F(SnapshotRecord, ExportProgressIsReadFromItsFile)
     unsigned long long done = 9, total = 9;
     int step = 9;
     EXPECT_EQ(snapshot.getExportProgress(done, total, step), 0);
-    EXPECT_EQ(std::vector<unsigned long long>({done, total}), std::vector<unsigned long long>({0, 0}));
+    EXPECT_EQ(done + total, 0u);
     EXPECT_EQ(step, 18990592);
 
-    const unsigned long long most = std::numeric_limits<unsigned long long>::max();
     const struct {
         const char *text;
-        const char *missing; ///< null when the file is complete
         int step;
         unsigned long long done, total;
     } cases[] = {
-        {"step=2\ndone_bytes=10\ntotal_bytes=20\n", nullptr, 2, 10, 20},
-        {"total_bytes = \"0x14\"\ndone_bytes = \"0xa\"\nstep = \"-7\"\n", nullptr, -7, 10, 20},
-        {"step=010\ndone_bytes=18446744073709551615\ntotal_bytes=18446744073709551615\n", nullptr, 10, most, most},
-        {"", "step", 9, 9, 9},
-        {"step=5\n", "done_bytes", 5, 9, 9},
-        {"step=5\ndone_bytes=10\ntotal=20\n", "total_bytes", 5, 10, 9},
+        {"step=2\ndone_bytes=10\ntotal_bytes=20\n", 2, 10, 20},
+        {"total_bytes = \"0x14\"\ndone_bytes = \"0xa\"\nstep = \"-7\"\n", -7, 10, 20},
+        {"step=010\ndone_bytes=18446744073709551615\ntotal_bytes=1\n", 10, UINT64_MAX, 1},
     };
     for (const auto &c : cases) {
         writeFile(path, c.text);
-        done = total = 9;
-        step = 9;
-        EXPECT_EQ(snapshot.getExportProgress(done, total, step), c.missing ? 18990017 : 0) << c.text;
-        EXPECT_EQ(logged(), c.missing ? Lines{": Failed to get export progress from '" + path + "': key = " + c.missing}
-                                      : Lines());
+        EXPECT_EQ(snapshot.getExportProgress(done, total, step), 0) << c.text;
         EXPECT_EQ(step, c.step) << c.text;
         EXPECT_EQ(done, c.done) << c.text;
         EXPECT_EQ(total, c.total) << c.text;
     }
     EXPECT_EQ(called().back(), "NLIBCFileGetKeyValue(" + path + ", total_bytes, 128)");
+}
+
+// Lists.
+
+class SnapshotLists : public LibraryTest {
+protected:
+    SnapshotLists()
+    {
+        addLUN(3, "lun");
+        addLUN(4, "other");
+        addSnapshot(4, 1, "other's");
+        addSnapshot(3, 9, "ninth").app_keys = {"b", "a"};
+        addSnapshot(3, 2, "second").is_locked = true;
+    }
+
+    std::vector<ISCSISnapshotInfo> snapshots{ISCSISnapshotInfo("old")};
+
+    std::string names() const
+    {
+        std::string names;
+        for (const auto &snapshot : snapshots)
+            names += snapshot.name + " ";
+        return names;
+    }
+};
+
+TEST_F(SnapshotLists, AreInThePlatformsOrderAndSortNewestFirst)
+{
+    const struct {
+        int lid;
+        long time;
+        const char *query, *names;
+    } cases[] = {
+        {3, 0, "2, 3, 0", "second ninth "},
+        {0, 0, "2, 0, 0", ""},
+        {-1, EPOCH + 9, "64, 0, 1234571499", "ninth "},
+        {4, EPOCH, "66, 4, 1234571490", "other's "},
+        {-1, 0, "0, 0, 0", "second ninth other's "},
+    };
+    for (const auto &c : cases) {
+        EXPECT_EQ(ISCSISnapshotInfo::ListSnapshot(c.lid, snapshots, c.time, 0), 0);
+        EXPECT_EQ(names(), c.names);
+        EXPECT_EQ(called(), Lines{std::string("NORViSCSISnapshotConfLoad(") + c.query + ")"});
+    }
+    std::sort(snapshots.begin(), snapshots.end(), ISCSISnapshotInfo::CompareBySnapshotTime);
+    EXPECT_EQ(names(), "ninth second other's ");
+    EXPECT_FALSE(ISCSISnapshotInfo::CompareBySnapshotTime(snapshots[0], snapshots[0]));
+}
+
+TEST_F(SnapshotLists, LockFactsComeWhenAskedFor)
+{
+    for (int filter = 0; filter < 8; ++filter) {
+        EXPECT_EQ(ISCSISnapshotInfo::ListSnapshot(3, snapshots, 0, filter), 0);
+        ISCSISnapshotInfo second(fake::model().snapshots.at({3, 2}).record),
+            ninth(fake::model().snapshots.at({3, 9}).record);
+        second.is_action_locked = (filter & ACTION_LOCK) != 0;
+        if (filter & APP_KEYS)
+            ninth.locked_app_keys = {"a", "b"};
+        ASSERT_EQ(snapshots.size(), 2u);
+        EXPECT_EQ(snapshots[0].toString(), second.toString()) << filter;
+        EXPECT_EQ(snapshots[1].toString(), ninth.toString()) << filter;
+    }
+    fake::failCall("NORViSCSIIsSnapshotLocked", 2, INJECTED);
+    EXPECT_EQ(ISCSISnapshotInfo::ListSnapshot(-1, snapshots, 0, ACTION_LOCK), INJECTED);
+    EXPECT_EQ(names(), "second ") << "what came before the failing one";
+    fake::failCall("NLIBCSzListGet", 2, 0);
+    EXPECT_EQ(ISCSISnapshotInfo::ListSnapshot(-1, snapshots, 0, APP_KEYS), 18990309);
+    EXPECT_EQ(names(), "second ");
 }
 
 } // namespace

@@ -16,24 +16,20 @@ TEST(Text, SizesAreChainsOfBinaryUnits)
     const struct {
         uint64_t bytes;
         const char *text;
-    } cases[] = {
-        {0, "0bytes"},
-        {1, "1bytes"},
-        {1023, "1023bytes"},
-        {1024, "1KB"},
-        {1025, "1KB,1bytes"},
-        {1536, "1KB,512bytes"},
-        {1073741824, "1GB"},
-        {1610612739, "1GB,512MB,3bytes"},
-        {uint64_t{1} << 60, "1EB"},
-        {(uint64_t{1} << 50) + 1024, "1PB,1KB"},
-        {UINT64_MAX, "15EB,1023PB,1023TB,1023GB,1023MB,1023KB,1023bytes"},
-    };
+    } cases[] = {{0, "0bytes"},
+                 {1, "1bytes"},
+                 {1023, "1023bytes"},
+                 {1024, "1KB"},
+                 {1536, "1KB,512bytes"},
+                 {1610612739, "1GB,512MB,3bytes"},
+                 {uint64_t{1} << 60, "1EB"},
+                 {(uint64_t{1} << 50) + 1024, "1PB,1KB"},
+                 {UINT64_MAX, "15EB,1023PB,1023TB,1023GB,1023MB,1023KB,1023bytes"}};
     for (const auto &c : cases)
         EXPECT_EQ(FormatSize(c.bytes), c.text);
 }
 
-class StringCopyTest : public LibraryTest {};
+using StringCopyTest = LibraryTest;
 
 TEST_F(StringCopyTest, FillsAFieldToItsLastByteAndNoFurther)
 {

@@ -22,13 +22,10 @@ TEST_F(TaskRecord, FillsTheSDKsRecordWhenItIsComplete)
 {
     _tag_iscsi_task_ record;
     EXPECT_EQ(task("", true, std::string(319, 'p'), TASK).fillVISCSITask(record), 0) << "the SDK gives it its UUID";
-    EXPECT_EQ(at<uint8_t>(&record, 37), 1);
-    EXPECT_EQ(textAt(&record, 38), SOURCE);
-    EXPECT_EQ(textAt(&record, 75), DESTINATION);
-    EXPECT_STREQ(textAt(&record, 112), LOCAL_NODE);
-    EXPECT_STREQ(textAt(&record, 149), PEER_NODE);
-    EXPECT_EQ(textAt(&record, 186), std::string(319, 'p'));
-    EXPECT_EQ(textAt(&record, 506), TASK);
+    EXPECT_EQ(record.is_source, 1);
+    EXPECT_EQ(record.src_lun_uuid + std::string(record.dst_lun_uuid), SOURCE + DESTINATION);
+    EXPECT_EQ(record.src_node_uuid + std::string(record.dst_node_uuid), LOCAL_NODE + std::string(PEER_NODE));
+    EXPECT_EQ(record.root_path + std::string(record.parent_task_uuid), std::string(319, 'p') + TASK);
 
     ISCSITaskInfo incomplete[] = {task("", false),  task(TASK, true, ""), task(TASK, true),
                                   task(TASK, true), task(TASK, true),     task(TASK, true)};
@@ -92,34 +89,6 @@ TEST_F(TaskRecord, LoadsWithoutWhatIsGoneUnlessStrict)
     EXPECT_EQ(info.getLockPath(), LOCK_FILE);
     EXPECT_EQ(ISCSITaskInfo().getLockPath(), "");
     EXPECT_EQ(ISCSITaskInfo().loadFromConfig(record, false), 18990818);
-}
-
-TEST_F(TaskRecord, SelectorsNameATask)
-{
-    const std::string second = "ABCDEF00-0000-4000-8000-00000000000f";
-    addTask(true);
-    addTask(false, second);
-    const struct {
-        std::string selector;
-        int code;
-        std::string uuid;
-        Lines lines;
-    } cases[] = {
-        {"", 0, "", {}},
-        {second, 0, second, {}},
-        {"rep#1", 0, TASK, {}},
-        {"Rep#2", 0, second, {}},
-        {"rep#0", 18990831, "before", {": Index of task is out of range. index: 0, #nodes: 2"}},
-        {"rep#3", 18990831, "before", {": Index of task is out of range. index: 3, #nodes: 2"}},
-        {"rep#2x", 18990831, "before", {": Invalid task UUID or index. input: rep#2x"}},
-        {TASK + "0", 18990831, "before", {": Invalid task UUID or index. input: " + TASK + "0"}},
-    };
-    for (const auto &c : cases) {
-        std::string uuid = "before";
-        EXPECT_EQ(ISCSITaskInfo::GetTaskUUID(c.selector, uuid), c.code) << c.selector;
-        EXPECT_EQ(uuid, c.uuid);
-        EXPECT_EQ(logged(), c.lines);
-    }
 }
 
 TEST(BaseVersion, IsTheDestinationsOwnStateOrItsNewestCommonSnapshot)

@@ -13,7 +13,7 @@ ISCSILIBTarget newTarget(bool is_enabled)
         MUTUAL_SECRET};
 }
 
-class TargetOperations : public LibraryTest {};
+using TargetOperations = LibraryTest;
 
 TEST_F(TargetOperations, CreateMasksBeforeItEnables)
 {
@@ -36,16 +36,9 @@ TEST_F(TargetOperations, CreateMasksBeforeItEnables)
 TEST_F(TargetOperations, CreateRefusesTextsThatDoNotFit)
 {
     ISCSILIBTarget target = newTarget(true);
-    target.info.name = std::string(256, 'n');
-    EXPECT_EQ(target.createTarget(), 18990025);
-    Lines lines = logged();
-    ASSERT_EQ(lines.size(), 3u);
-    EXPECT_EQ(lines[2], "createTarget: Failed to fill ISCSI_TARGET. target: " + target.info.toString());
-
-    target = newTarget(true);
     target.info.mutual_password = MUTUAL_SECRET + std::string(64, 'x');
     EXPECT_EQ(target.createTarget(), 18990025);
-    EXPECT_EQ(logged().size(), 3u); // which fails the test if the secret is in a line
+    EXPECT_EQ(logged().back(), "createTarget: Failed to fill ISCSI_TARGET. target: " + target.info.toString());
     EXPECT_EQ(called(), Lines());
 }
 
@@ -54,12 +47,7 @@ TEST_F(TargetOperations, DeleteLoadsTheTargetFirst)
     addTarget(5, "five");
     EXPECT_EQ(ISCSILIBTarget(5).deleteTarget(), 0);
     EXPECT_EQ(called(), (Lines{"NORViSCSIConfGet(0x1001, 5)", "NORViSCSITargetRemove(5)"}));
-
-    ISCSILIBTarget gone(5);
-    EXPECT_EQ(gone.deleteTarget(), 18990722);
-    EXPECT_EQ(logged(), (Lines{"loadFromConfig: No such target. target ID: 5",
-                               "deleteTarget: Failed to fill ISCSI_TARGET. info: " + gone.info.toString() +
-                                   ". error: 18990722 (Failed to load target)"}));
+    EXPECT_EQ(ISCSILIBTarget(5).deleteTarget(), 18990722);
     EXPECT_EQ(called(), Lines{"NORViSCSIConfGet(0x1001, 5)"});
 }
 

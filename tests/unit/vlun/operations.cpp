@@ -70,8 +70,8 @@ TEST_F(VirtualLUNs, ALoadedRecordGoesByItsSourceLUN)
         EXPECT_EQ(info.loadFromConfig(out, 0), 0);
         EXPECT_EQ(info.toString(), "uuid: " + UUID + " ,type: " +
                                        (kind == 1 || kind == 3 ? std::to_string(kind) : "0") + " ,src_lun_uuid: ");
-        EXPECT_EQ(at<int32_t>(&out, 8), 3);
-        EXPECT_EQ(at<int32_t>(&out, 5496), kind);
+        EXPECT_EQ(out.src_lid, 3);
+        EXPECT_EQ(out.kind, kind);
     }
     _tag_viscsi_virtual_lun_ out{};
     EXPECT_EQ(ISCSIVLUNInfo().loadFromConfig(out, 0), 18991002);
@@ -99,16 +99,16 @@ void transfer()
 
 /// Runs `act` on the virtual LUN; what it writes into the text is the outputs.
 Operation onVLUN(const char *name, int (*act)(ISCSILIBVLUN &, std::string &), const std::string &untouched,
-                 const std::vector<Codes> &codes)
+                 const Failures &failures)
 {
-    const auto run = [act] {
-        ISCSILIBVLUN vlun(ISCSI::VLUN_TYPE_1, UUID);
+    const auto run = [act](ISCSILIBVLUN &vlun, std::string &outputs) {
         vlun.info.uuid = VLUN;
-        std::string outputs;
+        outputs.clear();
         const int code = act(vlun, outputs);
-        return Outcome{code, "", outputs + vlun.info.uuid};
+        outputs += vlun.info.uuid;
+        return code;
     };
-    return sweptForCodes(name, transfer, run, untouched, codes);
+    return on([] { return ISCSILIBVLUN(ISCSI::VLUN_TYPE_1, UUID); }, name, transfer, run, untouched, failures);
 }
 
 int status(ISCSILIBVLUN &vlun, std::string &outputs)
