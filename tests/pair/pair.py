@@ -42,8 +42,8 @@ def run(*command, check=True, timeout=120, stdin="", **options):
     return result
 
 
-def wait_until(true, what, seconds=20):
-    """Returns what `true()` returned, once that is true."""
+def wait_until(true, what, seconds=120):
+    """Returns what `true()` returned, once that is true. What takes longer hangs: a busy machine may be slow."""
     end = time.monotonic() + seconds
     while True:
         if outcome := true():
@@ -54,12 +54,20 @@ def wait_until(true, what, seconds=20):
 
 
 def is_alive(pid):
-    """Whether there is such a process, and it is not merely waiting to be forgotten."""
+    """Whether there is such a process, and it is not merely waiting to be forgotten. Its first thread may end before the others,
+    which still have its files open."""
     try:
         with open(f"/proc/{pid}/stat", encoding="utf-8") as stat:
-            return stat.read().rpartition(")")[2].split()[0] not in "ZX"
+            return stat.read().rpartition(")")[2].split()[0] not in "ZX" or len(os.listdir(f"/proc/{pid}/task")) > 1
     except (FileNotFoundError, ProcessLookupError):
         return False
+
+
+def kill(pids, sig=signal.SIGKILL):
+    """Sends the signal to those that still run."""
+    for pid in pids:
+        with contextlib.suppress(ProcessLookupError):
+            os.kill(pid, sig)
 
 
 class Machine:
@@ -158,8 +166,7 @@ class Machine:
         """Sends the signal to the machine's processes of this name; their IDs."""
         pids = self.processes(name)
         assert pids, f"no {name} runs on {self.name}"
-        for pid in pids:
-            os.kill(pid, sig)
+        kill(pids, sig)
         return pids
 
     def set_clock(self, seconds):
@@ -203,9 +210,7 @@ class Appliance(Machine):
 
         def nothing_runs():
             runs = [pid for pid in self.processes() if pid not in stays]
-            for pid in runs:
-                with contextlib.suppress(ProcessLookupError):
-                    os.kill(pid, signal.SIGKILL)
+            kill(runs)
             return not runs
 
         wait_until(nothing_runs, f"nothing runs on {self.name}")

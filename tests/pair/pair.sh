@@ -63,7 +63,7 @@ first() { xargs <"/proc/$(<"$place/world")/task/$(<"$place/world")/children"; }
 stop() {
     exec 8>&-
     ! is_up || kill -KILL "$(first)" || true
-    flock --timeout 30 "$place/lock" rm -rf "$place" || die "some of the pair's processes do not end"
+    flock --timeout 120 "$place/lock" rm -rf "$place" || die "some of the pair's processes do not end"
 }
 
 down() {

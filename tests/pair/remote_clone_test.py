@@ -11,6 +11,7 @@ from pair import VOLUME, run, wait_until
 
 SIZE_MIB = 48
 SLOW = "200mbit"  # the same takes two seconds then
+SLOWEST = "16mbit"  # what is to be disturbed is under way for half a minute
 
 
 class RemoteClone(PairTest):
@@ -36,8 +37,8 @@ class RemoteClone(PairTest):
     def full_speed(self):
         run("tc", "qdisc", "del", "dev", self.two.name, "root", check=False)
 
-    def slow(self):
-        run("tc", "qdisc", "replace", "dev", self.two.name, "root", "tbf", "rate", SLOW, "burst", "256k", "latency", "100ms")
+    def slow(self, rate=SLOW):
+        run("tc", "qdisc", "replace", "dev", self.two.name, "root", "tbf", "rate", rate, "burst", "256k", "latency", "100ms")
 
     def command(self, name, lun="source"):
         return "lun", "remote-clone", lun, "--node", self.two.address, "--name", name, "--location", VOLUME
@@ -48,7 +49,7 @@ class RemoteClone(PairTest):
     def start_slow_clone(self, name):
         """`iscsictl ... --watch` in the background, once data flows."""
         wait_until(lambda: self.one.json("vlun", "list") == [], "the virtual LUN of the clone before goes")
-        self.slow()
+        self.slow(SLOWEST)
         watching = self.one.start("iscsictl", *self.command(name), "--watch", stdin=subprocess.DEVNULL,
                                   stdout=subprocess.PIPE, stderr=subprocess.PIPE)
         wait_until(lambda: self.moved() > 0 or watching.poll() is not None, "data flows")
@@ -67,9 +68,16 @@ class RemoteClone(PairTest):
 
     def workers(self):
         """The processes of a clone that has got going: who watches for the user, who sends, who watches to tidy up."""
-        return wait_until(lambda: len(found := sorted(self.one.processes("iscsictl"))) == 3 and found, "a clone's three processes")
+        def settled():
+            """Who asked for the clone is a child of who watches, and goes when the others are there."""
+            found = sorted(self.one.processes("iscsictl"))
+            if len(found) != 3:
+                return None
+            with open(f"/proc/{found[0]}/task/{found[0]}/children", encoding="ascii") as children:
+                return None if children.read() else found
+        return wait_until(settled, "a clone's three processes")
 
-    def outcome(self, watching, seconds=60):
+    def outcome(self, watching, seconds=120):
         said = watching.communicate(timeout=seconds)
         return watching.returncode, "".join(said)
 
@@ -113,7 +121,7 @@ class RemoteClone(PairTest):
         with open("/tmp/rounds", "w", encoding="ascii") as script:
             for number in range(1, 250):
                 script.writelines(f"write -q -P {number} {place * gap} 4k\n" for place in range(places))
-                script.write("sleep 40\n")  # or a quick disk would have them all before the clone ends
+                script.write("sleep 100\n")  # or a quick disk would have them all before the clone ends
         with open("/tmp/rounds", encoding="ascii") as script:
             writer = subprocess.Popen(["qemu-io", "--image-opts", image(self.one, "written")], stdin=script,
                                       stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL)
@@ -212,9 +220,9 @@ class RemoteClone(PairTest):
         """The data arrives all the same; the virtual LUN stays, and can be seen and removed."""
         watching = self.start_slow_clone("arrives")
         os.kill(self.workers()[2], signal.SIGKILL)
+        self.full_speed()
         code, said = self.outcome(watching)
         self.assertEqual(code, 0, said)
-        self.full_speed()
         self.assertEqual(self.transfer()["status"], "complete")
         self.one.iscsictl("vlun", "delete", self.transfer()["uuid"])
         self.whole("arrives", made=True)

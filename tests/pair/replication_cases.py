@@ -4,6 +4,7 @@ from pair import VOLUME, run, wait_until
 
 SIZE_MIB = 64
 SLOW = "80mbit"
+SLOWEST = "16mbit"  # what is to be disturbed is under way for half a minute
 
 
 class ReplicationTest(PairTest):
@@ -57,8 +58,8 @@ class ReplicationTest(PairTest):
         old.iscsictl("replication", "demote", self.task)
         new.iscsictl("lun", "map", self.lun, "data")
 
-    def wait_idle(self, appliance=None, seconds=90):
-        wait_until(lambda: not self.sending(appliance)["is_locked"], "the sending ends", seconds)
+    def wait_idle(self, appliance=None):
+        wait_until(lambda: not self.sending(appliance)["is_locked"], "the sending ends")
 
     def replica(self, appliance=None):
         """The checksum of the destination, as an initiator reads it there."""
@@ -83,7 +84,7 @@ class ReplicationTest(PairTest):
         for fact in ("name", "version", "description", "taken_by", "snapshot_time", "is_app_consistent", "is_user_locked", "total_size"):
             self.assertEqual(there[fact], here[fact], fact)
 
-    def begin(self, name="disturbed", after_mib=4, rate=SLOW):
+    def begin(self, name="disturbed", after_mib=4, rate=SLOWEST):
         """A slow sending of a new snapshot, with data on its way; the snapshot."""
         snapshot = self.take(name)
         self.slow(rate)

@@ -1,4 +1,5 @@
 """Faults while snapshots are sent: afterwards no data is lost, nothing stays locked, and the next sending succeeds or says why not."""
+import contextlib
 import json
 import os
 import random
@@ -8,20 +9,31 @@ import subprocess
 import time
 
 from cases import MIB, checksum, checksum_at, image, main, random_file, write
-from pair import VOLUME, is_alive, run, wait_until
-from replication_cases import SIZE_MIB, ReplicationTest
+from pair import VOLUME, is_alive, kill, run, wait_until
+from replication_cases import SIZE_MIB, SLOWEST, ReplicationTest
 
 LONG = bool(os.environ.get("ISCSIWEBAPI_LONG"))
 KILLS = 120 if LONG else 12
 CUTS = (1, 10, 60) if LONG else (1, 10)
 SLOWER = "40mbit"  # there is time to flush
-SLOWEST = "16mbit"  # a change is under way for seconds
 READ_WRITE, READ_ONLY = 3261, 3262
 
 
 def argument_of(pid, text):
-    with open(f"/proc/{pid}/cmdline", encoding="utf-8", errors="replace") as file:
-        return text in file.read()
+    with contextlib.suppress(FileNotFoundError, ProcessLookupError):
+        with open(f"/proc/{pid}/cmdline", encoding="utf-8", errors="replace") as file:
+            return text in file.read()
+    return False
+
+
+def has_open(pid, name):
+    """Whether the process, which may end meanwhile, has a file open whose path ends so."""
+    with contextlib.suppress(FileNotFoundError, ProcessLookupError):
+        for file in os.scandir(f"/proc/{pid}/fd"):
+            with contextlib.suppress(FileNotFoundError):
+                if os.readlink(file.path).endswith(name):
+                    return True
+    return False
 
 
 class Faults(ReplicationTest):
@@ -33,12 +45,7 @@ class Faults(ReplicationTest):
 
     def senders(self):
         """The source's processes that send; its other ones wait for them."""
-        def sends(pid):
-            try:
-                return any(os.readlink(f"/proc/{pid}/fd/{fd}").endswith(f"sending-{self.task}") for fd in os.listdir(f"/proc/{pid}/fd"))
-            except FileNotFoundError:
-                return False
-        return [pid for pid in self.one.processes("iscsictl") if sends(pid)]
+        return [pid for pid in self.one.processes("iscsictl") if has_open(pid, f"sending-{self.task}")]
 
     def workers(self):
         senders = self.senders()
@@ -48,14 +55,13 @@ class Faults(ReplicationTest):
         return [pid for pid in self.two.processes("tgtd") if argument_of(pid, f":{port}")]
 
     def killed(self, pids):
-        for pid in pids:
-            os.kill(pid, signal.SIGKILL)
+        kill(pids)
         wait_until(lambda: not any(map(is_alive, pids)), "they are dead")
         return len(pids)
 
     def give_up(self):
         """Ends a sending whose next try is half a minute away."""
-        wait_until(lambda: not self.senders(), "the sender ends", 90)
+        wait_until(lambda: not self.senders(), "the sender ends")
         self.killed(self.workers())
         self.wait_idle()
 
@@ -67,7 +73,8 @@ class Faults(ReplicationTest):
             self.two.start_web()
 
     def expect_unlocked(self):
-        wait_until(lambda: not self.one.processes("iscsictl"), "no worker is left", 60)
+        for appliance, program in ((self.one, "iscsictl"), (self.one, "iscsi-webapi"), (self.two, "iscsi-webapi")):
+            wait_until(lambda: not appliance.processes(program), f"no {program} is left on {appliance.name}")
         for appliance in (self.one, self.two):
             wait_until(lambda: not self.sending(appliance)["is_locked"], f"the task is not locked on {appliance.name}")
             lun = appliance.json("lun", "show", self.lun)
@@ -124,7 +131,7 @@ class Faults(ReplicationTest):
                 self.full_speed()
                 start.wait(timeout=120)
                 self.services_back()
-                wait_until(lambda: not self.senders(), "the sender ends", 90)
+                wait_until(lambda: not self.senders(), "the sender ends")
                 if self.sending()["error"]:
                     self.give_up()
                 self.wait_idle()
@@ -142,12 +149,12 @@ class Faults(ReplicationTest):
         self.fail_over(self.two, self.one)
         write(self.one, "data", random_file("/tmp/other", SIZE_MIB))
         snapshot = self.begin(rate=SLOWER)
-        wait_until(lambda: self.arrived() > 0, "some of it is flushed", 60)
+        wait_until(lambda: self.arrived() > 0, "some of it is flushed")
         flushed = self.arrived()
         self.killed(self.senders())
         self.full_speed()
         received = self.two.received_bytes()
-        wait_until(lambda: self.sending()["sent_size"] == SIZE_MIB * MIB, "the worker sends again", 120)
+        wait_until(lambda: self.sending()["sent_size"] == SIZE_MIB * MIB, "the worker sends again")
         self.expect_unlocked()
         self.assertLess(self.two.received_bytes() - received, (SIZE_MIB + 2) * MIB - flushed)
         self.expect_replica(snapshot)
@@ -155,9 +162,9 @@ class Faults(ReplicationTest):
     def test_stopped_between_tries(self):
         self.begin()
         self.killed(self.senders())
-        wait_until(lambda: self.sending()["error"] not in (0, -19), "the worker knows that it failed", 10)
+        wait_until(lambda: self.sending()["error"] not in (0, -19), "the worker knows that it failed")
         self.one.iscsictl("replication", "stop", self.task)
-        self.wait_idle(seconds=60)
+        self.wait_idle()
         self.assertEqual(self.sending()["error"], -19)
         self.refused(self.one, "replication", "stop", self.task, says="not sending")
         self.expect_whole(self.take("later"))
@@ -179,7 +186,7 @@ class Faults(ReplicationTest):
 
     def test_peer_restarted(self):
         snapshot = self.begin(rate=SLOWER)
-        wait_until(lambda: self.arrived() > 0, "some of it is flushed", 60)
+        wait_until(lambda: self.arrived() > 0, "some of it is flushed")
         self.two.restart()
         flushed = self.arrived()
         self.assertGreater(flushed, 0)
@@ -208,7 +215,7 @@ class Faults(ReplicationTest):
         self.two.iscsictl("lun", "create", "fat", "--location", VOLUME, "--size", str((free // MIB - SIZE_MIB // 2) * MIB), "--type", "file")
         snapshot = self.take("too much")
         self.one.iscsictl("replication", "send", self.task, snapshot)
-        wait_until(lambda: self.sending()["error"], "the sending fails", 60)
+        wait_until(lambda: self.sending()["error"], "the sending fails")
         self.assertEqual(self.sending()["error"], 18990002)
         self.assertIn("Out of volume space", self.one.iscsictl("events"))
         self.give_up()
@@ -220,7 +227,7 @@ class Faults(ReplicationTest):
                      f" while fallocate --offset $(stat --format %s {filler}) --length $size {filler}; do :; done; done 2>/dev/null")
         snapshot = self.take("no more")
         self.one.iscsictl("replication", "send", self.task, snapshot)
-        wait_until(lambda: self.sending()["error"], "the sending fails", 60)
+        wait_until(lambda: self.sending()["error"], "the sending fails")
         self.assertEqual(self.sending()["error"], 18990002)
         self.give_up()
         self.two.run("rm", filler)
@@ -327,7 +334,7 @@ class Faults(ReplicationTest):
         store.execute("UPDATE node_attributes SET value = ? WHERE uuid = ? AND key = 'rod_key'", (key[::-1], peer))
         snapshot = self.take("first")
         self.one.iscsictl("replication", "send", self.task, snapshot)
-        wait_until(lambda: self.sending()["error"], "the sending fails", 60)
+        wait_until(lambda: self.sending()["error"], "the sending fails")
         self.assertRegex(self.one.iscsictl("replication", "status", self.task), "cannot log in")
         self.assertNotIn(key, "".join(self.one.log_lines + self.two.log_lines))
         self.give_up()

@@ -1,4 +1,5 @@
 """Sending inside TLS: what passes on the wire, who is refused, and what happens when stunnel ends or is not there."""
+import contextlib
 import json
 import os
 import re
@@ -9,8 +10,8 @@ import subprocess
 import threading
 
 from cases import MIB, main
-from pair import BRIDGE_ADDRESS, run, wait_until
-from replication_cases import ReplicationTest
+from pair import BRIDGE_ADDRESS, kill, run, wait_until
+from replication_cases import SLOWEST, ReplicationTest
 
 TLS_PORT, DATA_PORT, WEB_PORT = 3263, 3261, 5443
 PATTERN = 0xA5
@@ -78,8 +79,7 @@ class Tls(ReplicationTest):
 
     def give_up(self):
         """No further tries of a sending that failed."""
-        for pid in self.one.processes("iscsictl"):
-            os.kill(pid, signal.SIGKILL)
+        kill(self.one.processes("iscsictl"))
         self.wait_idle()
 
     def check(self, address, port, **options):
@@ -90,7 +90,10 @@ class Tls(ReplicationTest):
 
     def servers(self, appliance):
         """Its stunnels that do not belong to a sending."""
-        return [pid for pid in appliance.processes("stunnel4") if os.getpgid(pid) == pid]
+        def leads(pid):
+            with contextlib.suppress(ProcessLookupError):
+                return os.getpgid(pid) == pid
+        return [pid for pid in appliance.processes("stunnel4") if leads(pid)]
 
     def senders(self, appliance):
         return set(appliance.processes("stunnel4")) - set(self.servers(appliance))
@@ -158,12 +161,12 @@ class Tls(ReplicationTest):
     def test_killed(self):
         for name, disturb in (
                 ("server", self.restart_stunnel),
-                ("tunnel", lambda: [os.kill(pid, signal.SIGKILL) for pid in self.senders(self.one)]),
+                ("tunnel", lambda: kill(self.senders(self.one))),
                 ("worker", lambda: self.one.kill("iscsictl"))):
             with self.subTest(name):
                 self.change(self.one, 0, 32 * 1024, len(name) + ord(name[0]))
                 snapshot = self.take(name)
-                self.slow()
+                self.slow(SLOWEST)
                 self.one.iscsictl("replication", "send", self.task, snapshot, "--encrypted")
                 wait_until(lambda: self.sending()["sent_size"] > 4 * MIB, "data flows")
                 before = self.senders(self.one)

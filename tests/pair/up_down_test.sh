@@ -17,7 +17,7 @@ pair() { "$here/pair.sh" "$@"; }
 nothing_runs() { # nothing_runs AFTER
     local tries=0
     while pgrep 'tgtd|lighttpd' >/dev/null || [[ $(pair status) != "no pair is up" ]]; do
-        [[ $((++tries)) -lt 200 ]] || die "after $1 there is still: $(ps axf)"
+        [[ $((++tries)) -lt 1200 ]] || die "after $1 there is still: $(ps axf)"
         sleep 0.1
     done
 }
