@@ -4,6 +4,8 @@
 /// that failed; callers above pass the code on unchanged.
 #pragma once
 
+#include <string>
+
 namespace norvhost {
 
 /// Records the reason for this thread and returns `code`. Never put a secret into it.
@@ -18,5 +20,17 @@ const char *lastError();
 
 /// The code that went with it.
 int lastErrorCode();
+
+/// What failed last stays that, whatever fails while this lives: for cleaning up after a failure.
+class KeptError {
+public:
+    KeptError() : reason(lastError()), code(lastErrorCode()) {}
+    KeptError(const KeptError &) = delete;
+    ~KeptError() { fail(code, "%s", reason.c_str()); }
+
+private:
+    const std::string reason;
+    const int code;
+};
 
 } // namespace norvhost

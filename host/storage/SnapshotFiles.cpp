@@ -72,11 +72,10 @@ int createSnapshotData(const LunRow &lun, _tag_iscsi_snapshot_ &snapshot, LunLoc
     if (!err)
         err = describe(snapshot);
     if (err) {
-        const std::string reason = lastError();
+        const KeptError kept;
         dropSnapshotData(snapshot);
-        return fail(err, "%s", reason.c_str());
     }
-    return 0;
+    return err;
 }
 
 int moveSnapshotData(const _tag_iscsi_snapshot_ &from, const _tag_iscsi_snapshot_ &to,

@@ -53,8 +53,10 @@ int SnapshotExport::prepare(const _tag_iscsi_snapshot_ *snapshot, const char *de
     int err = target.open(destination);
     if (!err)
         err = begin();
-    if (err)
+    if (err) {
+        const KeptError kept;
         undo();
+    }
     return err;
 }
 

@@ -73,8 +73,10 @@ int LunImport::prepare(const _tag_iscsi_lun_ *lun, const char *source_folder)
     if (int err = removeDataFile(importPath(row.record))) // of an import that was killed
         return err;
     const int err = job.begin({row.record.lid, 0}, folder, false, data_bytes);
-    if (err)
+    if (err) {
+        const KeptError kept;
         undo();
+    }
     return err;
 }
 

@@ -2,6 +2,7 @@
 /// was killed.
 #pragma once
 
+#include "host/core/LastError.h"
 #include "host/core/Lock.h"
 #include "host/state/Database.h"
 #include "host/storage/TransferProgress.h"
@@ -75,6 +76,7 @@ int startWorker(Work &work)
         _exit(0);
     }
     if (child < 0) {
+        const KeptError kept;
         work.undo();
         return NORV_ERR_FORK;
     }

@@ -177,9 +177,8 @@ int createInFolder(const std::string &folder, uint64_t size, const std::string &
     }
     int err = mountImage(row.image, row.path);
     if (!err && (err = registerMounted(row.path, row.image)) != 0) {
-        const std::string reason = lastError();
-        if (unmount(row.path) == 0)
-            fail(err, "%s", reason.c_str());
+        const KeptError kept;
+        unmount(row.path);
     }
     if (err)
         unlink(row.image.c_str());

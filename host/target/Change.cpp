@@ -114,10 +114,10 @@ int changeTargets(const std::function<int(std::vector<int> &)> &rows)
         lock.clear();
         return removeUnusedExportLinks();
     }
-    const std::string reason = lastError();
+    const KeptError kept;
     if (!daemonsMarked() || reconcile(tids) == 0)
         lock.clear();
-    return fail(err, "%s", reason.c_str());
+    return err;
 }
 
 } // namespace norvhost

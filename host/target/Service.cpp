@@ -81,19 +81,7 @@ int spawnDaemon(const std::string &name, std::vector<std::string> arguments, con
     posix_spawn_file_actions_adddup2(&actions, STDOUT_FILENO, STDERR_FILENO);
     posix_spawn_file_actions_addclosefrom_np(&actions, STDERR_FILENO + 1);
 
-    posix_spawnattr_t attributes;
-    posix_spawnattr_init(&attributes);
-    sigset_t signals;
-    sigfillset(&signals);
-    posix_spawnattr_setsigdefault(&attributes, &signals);
-    sigemptyset(&signals);
-    posix_spawnattr_setsigmask(&attributes, &signals);
-    posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGDEF | POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETSID);
-
-    std::vector<char *> argument_pointers, environment;
-    for (std::string &argument : arguments)
-        argument_pointers.push_back(argument.data());
-    argument_pointers.push_back(nullptr);
+    std::vector<char *> environment;
     std::string added = variable;
     environment.push_back(added.data());
     for (char **entry = environ; *entry; ++entry)
@@ -102,9 +90,9 @@ int spawnDaemon(const std::string &name, std::vector<std::string> arguments, con
             environment.push_back(*entry);
     environment.push_back(nullptr);
 
-    const int errnum =
-        posix_spawn(&pid, arguments[0].c_str(), &actions, &attributes, argument_pointers.data(), environment.data());
-    posix_spawnattr_destroy(&attributes);
+    const SpawnAttributes attributes(POSIX_SPAWN_SETSID);
+    const int errnum = posix_spawn(&pid, arguments[0].c_str(), &actions, attributes.get(), pointers(arguments).data(),
+                                   environment.data());
     posix_spawn_file_actions_destroy(&actions);
     return errnum ? failErrno(NORV_ERR_START_SERVICE, errnum, "cannot run %s", arguments[0].c_str()) : 0;
 }
@@ -209,9 +197,8 @@ int startTgtd(const Tgtd &daemon)
     });
     const int err = serves ? checkPortals(daemon, portals) : didNotStart(name);
     if (err && !ended) {
-        const std::string reason = lastError();
+        const KeptError kept;
         stopTgtd(daemon);
-        return fail(err, "%s", reason.c_str());
     }
     return err;
 }

@@ -176,20 +176,17 @@ int SenderJob::prepare(const char *portal, const char *node_uuid, const char *si
                                static_cast<unsigned long long>(size), static_cast<unsigned long long>(sink.sink.size))
                         : bindVirtualLun(row);
     if (err) {
-        const std::string reason = lastError();
+        const KeptError kept;
         closeSinkOf(row);
-        return fail(err, "%s", reason.c_str());
     }
-    return 0;
+    return err;
 }
 
 /// There is no worker.
 void SenderJob::undo()
 {
-    const std::string reason = lastError();
     endVirtualLun(row.uuid, EAGAIN, 0, row.total);
     closeSinkOf(row);
-    fail(NORV_ERR_FORK, "%s", reason.c_str());
 }
 
 void SenderJob::run()
@@ -252,10 +249,9 @@ int SenderJob::complete(uint64_t moved) const
 /// Closes it, too.
 bool SenderJob::sinkIsFull() const
 {
-    const std::string reason = lastError();
+    const KeptError kept;
     bool full = false;
-    if (closePeerSink(row.node, row.sink, row.sink_iqn, false, &full) != 0)
-        fail(-EIO, "%s", reason.c_str());
+    closePeerSink(row.node, row.sink, row.sink_iqn, false, &full);
     return full;
 }
 
