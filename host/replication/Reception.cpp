@@ -5,6 +5,7 @@
 #include "host/core/LastError.h"
 #include "host/replication/Roles.h"
 #include "host/replication/TaskStore.h"
+#include "host/state/Fields.h"
 #include "host/storage/FileClone.h"
 #include "host/storage/LunStore.h"
 #include "host/storage/MapFile.h"
@@ -153,6 +154,8 @@ int prepare(const Destination &destination, const Incoming &incoming, Reception 
 
 int iscsihost::beginReception(const std::string &task_uuid, const Incoming &incoming, Reception &reception)
 {
+    if (!isUuid(incoming.version)) // it is stored beside others, with blanks between
+        return fail(NORV_ERR_SENDING_SNAPSHOT, "version: is no UUID");
     Destination destination;
     Reception begun;
     if (int err = destination.load(task_uuid))

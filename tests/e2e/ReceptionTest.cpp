@@ -160,6 +160,15 @@ TEST_F(ReceptionTest, DataWithoutAVersionAreNoZeros)
     EXPECT_EQ(begin(first, none).holding, Holding::unknown);
 }
 
+TEST_F(ReceptionTest, AVersionThatIsNoneDoesNotGetIntoTheFile)
+{
+    receiveFirst();
+    Reception reception;
+    EXPECT_EQ(iscsihost::beginReception(task_uuid, {std::string(36, ' '), first, "blank"}, reception),
+              NORV_ERR_SENDING_SNAPSHOT);
+    EXPECT_EQ(versions().current, first);
+}
+
 TEST_F(ReceptionTest, ALunThatIsNoSinkAnyMoreIsLeftAlone)
 {
     receiveFirst();
