@@ -60,6 +60,7 @@ inline constexpr LibIscsiFunction<decltype(::iscsi_set_target_username_pwd)>
 inline constexpr LibIscsiFunction<decltype(::iscsi_set_targetname)> iscsi_set_targetname("iscsi_set_targetname");
 inline constexpr LibIscsiFunction<decltype(::iscsi_set_tcp_keepalive)>
     iscsi_set_tcp_keepalive("iscsi_set_tcp_keepalive");
+inline constexpr LibIscsiFunction<decltype(::iscsi_set_tcp_syncnt)> iscsi_set_tcp_syncnt("iscsi_set_tcp_syncnt");
 inline constexpr LibIscsiFunction<decltype(::iscsi_set_timeout)> iscsi_set_timeout("iscsi_set_timeout");
 inline constexpr LibIscsiFunction<decltype(::iscsi_synchronizecache16_task)>
     iscsi_synchronizecache16_task("iscsi_synchronizecache16_task");
