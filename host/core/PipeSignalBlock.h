@@ -1,4 +1,5 @@
-/// libiscsi writes to its socket without regard to SIGPIPE, which would end a caller that knows of no socket.
+/// libiscsi and libcurl write to their sockets without regard to SIGPIPE, which would end a caller that knows of no
+/// socket.
 #pragma once
 
 #include <csignal>

@@ -1,6 +1,7 @@
 #include "iscsihost/https.h"
 
 #include "host/core/LastError.h"
+#include "host/core/PipeSignalBlock.h"
 #include "host/peer/Address.h"
 #include "host/peer/Libraries.h"
 #include "host/peer/Pins.h"
@@ -51,6 +52,7 @@ private:
     int failed(CURLcode result);
     int seenPin(std::string &pin);
 
+    const PipeSignalBlock block; ///< also while the connection is closed
     const std::string server;
     const std::string host;
     const LibCurl *curl = nullptr;
@@ -92,6 +94,7 @@ int Exchange::begin(const std::string &protocol, const std::string &path, int co
     set(CURLOPT_CERTINFO, 1L);
     set(CURLOPT_CONNECTTIMEOUT, static_cast<long>(connect_seconds));
     set(CURLOPT_ERRORBUFFER, message);
+    set(CURLOPT_NOSIGNAL, 1L); // else one thread takes away what another has set
     return 0;
 }
 

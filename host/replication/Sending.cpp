@@ -24,6 +24,7 @@
 #include <cerrno>
 #include <chrono>
 #include <cstring>
+#include <future>
 #include <json/value.h>
 #include <memory>
 #include <syslog.h>
@@ -69,7 +70,11 @@ class OpenSink {
 public:
     OpenSink() = default;
     OpenSink(const OpenSink &) = delete;
-    ~OpenSink() { giveUp(); }
+    ~OpenSink()
+    {
+        const KeptError kept;
+        giveUp();
+    }
 
     int enter(const PairedNode &peer, const TaskRow &task, const Json::Value &opened, const std::string &rod_key,
               const Route &route)
@@ -135,10 +140,24 @@ int codeToStore(int err)
     return err == -ENOSPC ? NORV_ERR_OUT_OF_SPACE : isFinal(err) ? FINAL : err;
 }
 
+/// What became of telling the peer how far it has been flushed.
+struct Noted {
+    uint64_t place = 0;
+    int err = 0;
+    std::string reason;
+};
+
+/// After a sending that ended so.
+bool mayBeTriedAgain(int error)
+{
+    return error && error != STOPPED && error != FINAL;
+}
+
 /// One sending: prepared in the caller's process, carried out in a worker.
 class Sender {
 public:
-    int prepare(const _tag_iscsi_task_ &task, const char *snapshot_uuid, const char *base_version);
+    /// The `next_try` heeds a stop that was asked for since the one before.
+    int prepare(const _tag_iscsi_task_ &task, const char *snapshot_uuid, const char *base_version, bool next_try);
     void run();
     /// After a fork(), in the caller: the locks are the worker's.
     void leaveToChild()
@@ -156,7 +175,8 @@ private:
     int adapt(const Json::Value &reception);
     int sendAll(const OpenSink &sink);
     int complete(OpenSink &sink);
-    int note(uint64_t place);
+    int note(uint64_t place) const;
+    int noteOften(std::future<Noted> &noting);
     int tell(uint64_t moved);
     int checkStop() const;
     std::string arrivalPath() const { return std::string("/replications/") + task.record.uuid + "/arrival"; }
@@ -191,9 +211,9 @@ int findByVersion(int lid, const std::string &version, SnapshotRow &row)
     return 0;
 }
 
-int Sender::prepare(const _tag_iscsi_task_ &wanted, const char *snapshot_uuid, const char *base_version)
+int Sender::prepare(const _tag_iscsi_task_ &wanted, const char *snapshot_uuid, const char *base_version, bool next_try)
 {
-    if (int err = loadTask(std::string_view(wanted.uuid, strnlen(wanted.uuid, sizeof wanted.uuid)), task))
+    if (int err = loadTask(fieldText(wanted.uuid), task))
         return err;
     if (!task.record.is_source)
         return fail(NORV_ERR_NOT_A_SOURCE_TASK, "the task %s is a destination here", task.record.uuid);
@@ -224,7 +244,7 @@ int Sender::prepare(const _tag_iscsi_task_ &wanted, const char *snapshot_uuid, c
     }
     if (int err = iscsihost::describePairedNode(task.remoteNode(), peer))
         return err;
-    if (int err = requestStop(task.record.uuid, false))
+    if (int err = next_try ? 0 : requestStop(task.record.uuid, false))
         return err;
     was_full = task.progress.error == NORV_ERR_OUT_OF_SPACE;
     task.progress.sent_size = task.progress.send_total_size = task.progress.progress_value = 0;
@@ -244,6 +264,8 @@ void Sender::run()
     }
     if (task.progress.error == NORV_ERR_OUT_OF_SPACE && !was_full)
         NORVLogSet1(9, 1, EVENT_DESTINATION, lun.record.name, "Out of volume space", nullptr, nullptr);
+    if (!mayBeTriedAgain(task.progress.error))
+        requestStop(task.record.uuid, false); // the next sending is another one
     updateProgress(task.progress);
 }
 
@@ -271,6 +293,8 @@ int Sender::send()
     body["name"] = snapshot.record.name;
     if (int err = askNode(peer, "POST", arrivalPath(), body, reception))
         return err;
+    if (!reception.isObject())
+        return fail(NORV_ERR_BAD_RESPONSE, "%s does not say where its sink is", peer.host.c_str());
     OpenSink sink;
     if (int err = sink.enter(peer, task, reception["sink"], rod_key, route))
         return err;
@@ -311,6 +335,7 @@ int Sender::sendAll(const OpenSink &sink)
     if (left.empty())
         return 0;
     auto next = left.begin();
+    std::future<Noted> noting;
     noted = Clock::now();
     norvhost::Sending sending;
     sending.to = sink.unit();
@@ -322,11 +347,8 @@ int Sender::sendAll(const OpenSink &sink)
     };
     sending.flushed = [&](uint64_t place) { flushed = place; };
     sending.progress = [&](uint64_t moved) {
-        const bool due = flushed > offset && Clock::now() - noted > NOTE_INTERVAL;
-        // A web server that is away for a moment is no reason to stop: the next note says it too.
-        if (int err = due ? note(flushed) : 0; err && err != NORV_ERR_SEND_REQUEST)
-            return err;
-        return tell(moved);
+        const int err = noteOften(noting);
+        return err ? err : tell(moved);
     };
     if (int err = sendRanges(sending))
         return sink.explain(err);
@@ -342,16 +364,16 @@ int Sender::complete(OpenSink &sink)
     body["iqn"] = sink_name;
     body["total"] = Json::UInt64(total);
     if (int err = askNode(peer, "POST", arrivalPath() + "/end", body, answer)) {
-        const std::string reason = lastError();
+        const KeptError kept;
         note(flushed); // the next try needs not send it again
-        return fail(err, "%s", reason.c_str());
+        return err;
     }
     sink.completed();
     return 0;
 }
 
 /// What lies below the place is flushed on the peer.
-int Sender::note(uint64_t place)
+int Sender::note(uint64_t place) const
 {
     Json::Value body(Json::objectValue), answer;
     body["version"] = snapshot.record.version;
@@ -359,10 +381,28 @@ int Sender::note(uint64_t place)
     body["offset"] = Json::UInt64(place);
     body["moved"] = Json::UInt64(dataBelow(ranges, place));
     body["total"] = Json::UInt64(total);
-    noted = Clock::now();
-    if (int err = askNode(peer, "PATCH", arrivalPath(), body, answer))
-        return err;
-    offset = place;
+    return askNode(peer, "PATCH", arrivalPath(), body, answer);
+}
+
+/// In a thread of its own: on a long way, or of a busy peer, an answer takes as long as megabytes of data.
+int Sender::noteOften(std::future<Noted> &noting)
+{
+    if (noting.valid()) {
+        if (noting.wait_for(std::chrono::seconds(0)) != std::future_status::ready)
+            return 0;
+        const Noted heard = noting.get();
+        // A web server that is away for a moment is no reason to stop: the next note says it too.
+        if (heard.err && heard.err != NORV_ERR_SEND_REQUEST)
+            return fail(heard.err, "%s", heard.reason.c_str());
+        offset = heard.err ? offset : heard.place;
+    }
+    if (flushed > offset && Clock::now() - noted > NOTE_INTERVAL) {
+        noted = Clock::now();
+        noting = std::async([this, place = flushed] {
+            const int err = note(place);
+            return Noted{place, err, lastError()};
+        });
+    }
     return 0;
 }
 
@@ -480,9 +520,9 @@ int NORViSCSIReplicationTaskSendSnapshot(const _tag_iscsi_task_ *task, const cha
     if (!task || !snapshot_uuid || !rod_key)
         return fail(NORV_ERR_NULL_POINTER, "a task, a ROD key and a snapshot are needed");
     bool stop = false;
-    if (isNextTry(task->uuid))
-        if (int err = stopRequested(task->uuid, stop))
-            return err;
+    const bool next_try = isNextTry(task->uuid);
+    if (int err = next_try ? stopRequested(task->uuid, stop) : 0)
+        return err;
     if (stop)
         return endStopped(task->uuid);
     Sender sender;
@@ -496,7 +536,7 @@ int NORViSCSIReplicationTaskSendSnapshot(const _tag_iscsi_task_ *task, const cha
     if (!host.empty() && !isHost(host))
         return fail(NORV_ERR_TASK_ADDRESS, "address: is no host name and no address");
     sender.route = {host, static_cast<uint16_t>(port), encrypted};
-    if (int err = sender.prepare(*task, snapshot_uuid, full_sync ? nullptr : base_version))
+    if (int err = sender.prepare(*task, snapshot_uuid, full_sync ? nullptr : base_version, next_try))
         return err;
     const int child = NLIBCProcForkChildNoWait();
     if (child < 0)
@@ -517,8 +557,7 @@ int NORViSCSIReplicationTaskStopSendingSnapshot(const _tag_iscsi_task_ *task)
         return err;
     if (int err = readProgress(row, progress))
         return err;
-    const bool may_try_again = progress.error && progress.error != STOPPED && progress.error != FINAL;
-    if (!may_try_again && !isSending(task->uuid))
+    if (!mayBeTriedAgain(progress.error) && !isSending(task->uuid))
         return fail(NORV_ERR_TASK_NOT_RUNNING, "the task %s is not sending", task->uuid);
     return requestStop(task->uuid, true);
 }

@@ -184,6 +184,21 @@ class Faults(ReplicationTest):
                     self.give_up()
                 self.expect_whole(snapshot)
 
+    def test_web_server_hangs(self):
+        """Data flows on, and nothing is tried again."""
+        snapshot = self.begin(after_mib=1, rate=SLOWER)
+        servers = self.two.processes("lighttpd")
+        for pid in servers:
+            os.kill(pid, signal.SIGSTOP)
+        try:
+            wait_until(lambda: self.sending()["sent_size"] > (SIZE_MIB - 4) * MIB, "all of it is sent", 45)
+        finally:
+            for pid in servers + [service.pid for service in self.two.services]:  # what started one stops with it
+                os.kill(pid, signal.SIGCONT)
+        self.wait_idle()
+        self.assertEqual(self.sending()["error"], 0)
+        self.expect_replica(snapshot)
+
     def test_peer_restarted(self):
         snapshot = self.begin(rate=SLOWER)
         wait_until(lambda: self.arrived() > 0, "some of it is flushed")
@@ -310,6 +325,7 @@ class Faults(ReplicationTest):
         self.wait_idle()
         self.expect_unlocked()
         self.assertEqual(self.sending()["error"], -71, "nothing to try again")
+        self.assertIn("is a source here", self.sending()["reason"])
         self.refused(self.one, "replication", "send", self.task, first, says="Not a destination task")
         self.two.iscsictl("lun", "map", self.lun, "data")
         self.assertEqual(checksum_at(self.two, "data"), wanted, "the last whole state")
