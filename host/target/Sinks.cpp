@@ -77,14 +77,15 @@ std::string senderName(const std::string &uuid)
 }
 
 /// Where peers reach the read-write daemon.
-int sinkPortal(std::string &portal)
+int sinkPortals(std::vector<std::string> &portals)
 {
     std::vector<std::string> addresses;
     if (int err = portalAddresses(addresses))
         return err;
-    const std::string &first = addresses.front();
-    const bool any = first == "0.0.0.0" || first == "::";
-    portal = any ? ":" + std::to_string(read_write_port) : portalName(first, read_write_port);
+    for (const std::string &address : addresses) {
+        const bool any = address == "0.0.0.0" || address == "::";
+        portals.push_back(any ? ":" + std::to_string(read_write_port) : portalName(address, read_write_port));
+    }
     return 0;
 }
 
@@ -320,7 +321,7 @@ int openSinkFor(const LunRow &lun, iscsihost::Sink &sink)
     if (int err = checkSink(row))
         return err;
     iscsihost::Sink opened;
-    if (int err = sinkPortal(opened.portal))
+    if (int err = sinkPortals(opened.portals))
         return err;
     opened.iqn = "iqn.2001-01.norv:sink-" + newUuid();
     opened.lun = sink_lun_number;

@@ -1,6 +1,7 @@
 #include "host/transfer/PeerSink.h"
 
 #include "host/core/LastError.h"
+#include "host/peer/Address.h"
 #include "host/peer/NodeApi.h"
 #include "host/target/Sinks.h"
 #include "platform/dr_node.h"
@@ -27,16 +28,18 @@ int ask(const PairedNode &node, const std::string &lun_uuid, const char *what, c
 /// The node is another appliance: what it answers is looked at before it is used.
 bool readSink(const Json::Value &answer, Sink &sink)
 {
-    if (!answer.isObject() || !answer["portal"].isString() || !answer["iqn"].isString() || !answer["lun"].isInt() ||
+    if (!answer.isObject() || !answer["portals"].isArray() || !answer["iqn"].isString() || !answer["lun"].isInt() ||
         !answer["size"].isUInt64() || !answer["is_blank"].isBool())
         return false;
-    sink.portal = answer["portal"].asString();
+    for (const Json::Value &portal : answer["portals"])
+        sink.portals.push_back(portal.isString() ? portal.asString() : "");
     sink.iqn = answer["iqn"].asString();
     sink.lun = answer["lun"].asInt();
     sink.size = answer["size"].asUInt64();
     sink.blank = answer["is_blank"].asBool();
     sink.tls_port = answer["tls_port"].isInt() ? answer["tls_port"].asInt() : 0;
-    return sink.iqn.compare(0, 4, "iqn.") == 0 && sink.lun >= 0 && sink.tls_port >= 0 && sink.tls_port <= UINT16_MAX;
+    return !sink.portals.empty() && sink.iqn.compare(0, 4, "iqn.") == 0 && sink.lun >= 0 && sink.tls_port >= 0 &&
+           sink.tls_port <= UINT16_MAX;
 }
 
 /// "[::1]" of "::1"; names and IPv4 addresses as they are.
@@ -46,13 +49,26 @@ std::string bracketed(const std::string &host)
     return bare_ipv6 ? "[" + host + "]" : host;
 }
 
+/// The one where the appliance was reached for its web API, else the first: we may know nothing of the others'
+/// networks.
+std::string portalAt(const std::string &reached, const std::vector<std::string> &portals)
+{
+    for (const std::string &portal : portals) {
+        std::string host;
+        uint16_t port = 0;
+        if (portal.empty() || portal[0] == ':') // it listens everywhere
+            return bracketed(reached) + portal;
+        if (parseAuthority(portal, host, port) && host == reached)
+            return portal;
+    }
+    return portals.front();
+}
+
 /// How an open sink is entered, when its appliance is reached at `host` and has this ROD key.
 IscsiUnit unitOf(const Sink &sink, const std::string &host, const std::string &rod_key, const std::string &lun_uuid)
 {
     IscsiUnit unit;
-    unit.portal = sink.portal;
-    if (unit.portal.empty() || unit.portal[0] == ':') // it listens everywhere: where we reached it
-        unit.portal = bracketed(host) + unit.portal;
+    unit.portal = portalAt(host, sink.portals);
     unit.target = sink.iqn;
     unit.lun = sink.lun;
     const SinkLogIn log_in = sinkLogIn(rod_key, lun_uuid);

@@ -194,7 +194,7 @@ class Appliance(Machine):
     def __init__(self, name, address, volume_size="4G"):
         super().__init__(name, address)
         self.password = secrets.token_hex(8)
-        self.host("portal", "set", address)
+        self.host("portal", "set", "127.0.0.1", address)
         self.host("volume", "create", VOLUME, "--size", volume_size)
         self.host("account", "add", ACCOUNT, "--role", "admin", "--password-file", "-", stdin=self.password + "\n")
         self.boot()

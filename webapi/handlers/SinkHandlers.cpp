@@ -8,7 +8,8 @@ namespace webapi {
 Json::Value sinkForm(const iscsihost::Sink &sink)
 {
     Json::Value form(Json::objectValue);
-    form["portal"] = sink.portal;
+    for (const std::string &portal : sink.portals)
+        form["portals"].append(portal);
     form["iqn"] = sink.iqn;
     form["lun"] = sink.lun;
     form["tls_port"] = sink.tls_port;

@@ -4,17 +4,18 @@
 #include <cstdint>
 #include <iscsihost/host.h>
 #include <string>
+#include <vector>
 
 namespace iscsihost {
 
 /// An open sink.
 struct Sink {
-    std::string portal; ///< "address:port", or ":port" when this appliance listens on all its addresses
-    std::string iqn;    ///< of the target that exists until the sink is closed; names this opening
-    int lun = 0;        ///< LUN number in it
-    int tls_port = 0;   ///< of the same address, which leads there inside TLS; 0 when there is none
-    uint64_t size = 0;  ///< bytes
-    bool blank = false; ///< reads as zeros
+    std::vector<std::string> portals; ///< "address:port", or ":port" when this appliance listens on all its addresses
+    std::string iqn;                  ///< of the target that exists until the sink is closed; names this opening
+    int lun = 0;                      ///< LUN number in it
+    int tls_port = 0;                 ///< of the same addresses, which leads there inside TLS; 0 when there is none
+    uint64_t size = 0;                ///< bytes
+    bool blank = false;               ///< reads as zeros
 };
 
 /// Lets the holder of this appliance's ROD key write to the LUN, which must be of the sink kind. Whoever had it open
