@@ -28,8 +28,9 @@ Appliance::Appliance()
     setenv("ISCSI_HOST_STATE", (root + "/state").c_str(), 1);
     setenv("ISCSI_HOST_PORTALD", PORTALD_PATH, 1);
     setenv("ISCSI_HOST_RUN", (root + "/run").c_str(), 1);
-    std::filesystem::create_directory(root + "/volume");
-    EXPECT_EQ(iscsihost::addVolume(root + "/volume"), 0) << iscsi_host_last_error();
+    volume = root + "/volume";
+    std::filesystem::create_directory(volume);
+    EXPECT_EQ(iscsihost::addVolume(volume), 0) << iscsi_host_last_error();
 }
 
 void Appliance::SetUp()
@@ -41,16 +42,27 @@ Appliance::~Appliance()
 {
     EXPECT_EQ(norvhost::stopService(), 0) << iscsi_host_last_error();
     norvhost::closeDatabase();
+    if (volume == root + "/xfs") {
+        norvhost::ProgramResult result;
+        EXPECT_EQ(norvhost::runProgram({{"umount", volume}, {}, 60}, result), 0);
+        EXPECT_EQ(result.status, 0) << result.errors;
+    }
     std::filesystem::remove_all(root);
 }
 
-_tag_iscsi_lun_ Appliance::createLun(const std::string &name, uint64_t size, int type)
+void Appliance::useXfs(uint64_t size)
+{
+    volume = root + "/xfs";
+    ASSERT_EQ(iscsihost::createVolume(volume, size, root + "/image"), 0) << iscsi_host_last_error();
+}
+
+_tag_iscsi_lun_ Appliance::createLun(const std::string &name, uint64_t size, int type) const
 {
     _tag_iscsi_lun_ lun = {};
     lun.type = type;
     lun.size = size;
     setText(lun.name, name);
-    setText(lun.location, std::filesystem::path(getenv("ISCSI_HOST_STATE")).parent_path() / "volume");
+    setText(lun.location, volume);
     EXPECT_EQ(NORViSCSILunCreate(&lun), 0) << iscsi_host_last_error();
     return lun;
 }
@@ -122,9 +134,9 @@ int Appliance::grow(const _tag_iscsi_lun_ &lun, uint64_t size)
     return NORViSCSILunUpdate(&wanted);
 }
 
-Appliance::Store Appliance::createStore(const std::string &name)
+Appliance::Store Appliance::createStore(uint64_t size, int type) const
 {
-    const Store store = {createTarget(name), createLun(name)};
+    const Store store = {createTarget("store"), createLun("store", size, type)};
     map(store.lun, {store.target.tid});
     mask(store.target.tid, alice, NORV_AUTHORITY_READ_WRITE);
     mask(store.target.tid, bob, NORV_AUTHORITY_READ);

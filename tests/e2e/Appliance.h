@@ -39,9 +39,13 @@ protected:
     ~Appliance() override;
     void SetUp() override;
 
-    std::string root; ///< the temporary folder with state, run folder and volume
+    std::string root;   ///< the temporary folder with state, run folder and volumes
+    std::string volume; ///< where LUNs are made
 
-    static _tag_iscsi_lun_ createLun(const std::string &name, uint64_t size = 16 * MiB, int type = NORV_LUN_TYPE_THIN);
+    /// LUNs are made on an XFS from now on, which shares blocks.
+    void useXfs(uint64_t size);
+
+    _tag_iscsi_lun_ createLun(const std::string &name, uint64_t size = 16 * MiB, int type = NORV_LUN_TYPE_THIN) const;
     /// "iqn.2026-01.example:" and the name.
     static std::string iqn(const std::string &name);
     static _tag_iscsi_target_ request(const std::string &name);
@@ -54,12 +58,12 @@ protected:
     static void setDefault(const _tag_iscsi_target_ &target, int permission);
     static int grow(const _tag_iscsi_lun_ &lun, uint64_t size);
 
-    /// A target with one LUN of 16 MiB, number 1, that alice may write and bob may read.
+    /// A target with one LUN, number 1, that alice may write and bob may read.
     struct Store {
         _tag_iscsi_target_ target;
         _tag_iscsi_lun_ lun;
     };
-    static Store createStore(const std::string &name = "store");
+    Store createStore(uint64_t size = 16 * MiB, int type = NORV_LUN_TYPE_THIN) const;
 
     static const norvhost::Tgtd rw, ro;
     static norvhost::TgtdTarget shown(const norvhost::Tgtd &daemon, int tid);

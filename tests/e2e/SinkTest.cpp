@@ -1,7 +1,6 @@
 /// Sinks, and sending to them.
 #include "tests/e2e/Appliance.h"
 #include "tests/e2e/Initiator.h"
-#include "tests/e2e/OrderedWriter.h"
 
 #include "host/core/FileDescriptor.h"
 #include "host/core/Process.h"
@@ -67,19 +66,12 @@ protected:
     {
         Appliance::SetUp();
         ASSERT_EQ(norvhost::makeIdentity(), 0) << iscsi_host_last_error();
-        ASSERT_EQ(iscsihost::createVolume(root + "/xfs", 2000 * MiB, root + "/image"), 0) << iscsi_host_last_error();
-        source = create("source", NORV_LUN_TYPE_ADV);
-        sink = create("sink", NORV_LUN_TYPE_SINK);
+        useXfs(2000 * MiB);
+        source = createLun("source", 256 * MiB, NORV_LUN_TYPE_ADV);
+        sink = createLun("sink", 256 * MiB, NORV_LUN_TYPE_SINK);
     }
 
-    void TearDown() override
-    {
-        setRate("");
-        EXPECT_EQ(norvhost::stopService(), 0) << iscsi_host_last_error();
-        norvhost::ProgramResult result;
-        EXPECT_EQ(norvhost::runProgram({{"umount", root + "/xfs"}, {}, 60}, result), 0);
-        EXPECT_EQ(result.status, 0) << result.errors;
-    }
+    void TearDown() override { setRate(""); }
 
     /// A sending that is to be disturbed must not be over by then: this is how fast it may be, "" for no limit.
     static void setRate(const std::string &rate)
@@ -91,17 +83,6 @@ protected:
         norvhost::ProgramResult result;
         ASSERT_EQ(norvhost::runProgram({command, {}, 60}, result), 0) << iscsi_host_last_error();
         EXPECT_TRUE(rate.empty() || result.status == 0) << result.errors;
-    }
-
-    _tag_iscsi_lun_ create(const std::string &name, int type, uint64_t size = 256 * MiB)
-    {
-        _tag_iscsi_lun_ lun = {};
-        lun.type = type;
-        lun.size = size;
-        setText(lun.name, name);
-        setText(lun.location, root + "/xfs");
-        EXPECT_EQ(NORViSCSILunCreate(&lun), 0) << iscsi_host_last_error();
-        return lun;
     }
 
     static void put(const _tag_iscsi_lun_ &lun, uint64_t at, const std::string &data)
@@ -358,7 +339,7 @@ protected:
             for (directory_iterator file(process.path() / "fd", error); !error && file != end; file.increment(error)) {
                 std::error_code closed;
                 const std::string name = std::filesystem::read_symlink(file->path(), closed);
-                if (name.find(root + "/xfs/@iSCSITrg/#") == 0)
+                if (name.find(volume + "/@iSCSITrg/#") == 0)
                     return std::stoi(process.path().filename());
             }
         return 0;
@@ -412,29 +393,6 @@ TEST_F(VirtualLunTest, RemovalStopsItAtOnceAndLeavesTheSinkClosed)
     EXPECT_EQ(NORViSCSILunDelete(&sink), 0) << iscsi_host_last_error();
 }
 
-TEST_F(VirtualLunTest, ClonesOnePointInTimeUnderAWriter)
-{
-    const _tag_iscsi_target_ target = createTarget("store");
-    map(source, {target.tid});
-    setDefault(target, NORV_AUTHORITY_READ_WRITE);
-    for (uint64_t at = 32768; at < 64 * MiB; at += 32768) // a clone of so many extents takes its time
-        put(source, at, std::string(4096, 's'));
-    OrderedWriter writer(target.iqn, source.size);
-    ASSERT_TRUE(writer.connected);
-    ASSERT_TRUE(norvhost::waitFor(hang_limit, [&] { return writer.number > 10; }));
-    const uint64_t acknowledged = writer.number;
-    ASSERT_EQ(bind(), 0) << iscsi_host_last_error();
-    const uint64_t after = writer.number + 1;
-    EXPECT_EQ(wait().state, 0);
-    EXPECT_TRUE(norvhost::waitFor(hang_limit, [&] { return writer.number > after; })) << "the writer stands still";
-    EXPECT_FALSE(writer.failed);
-    const std::string path = norvhost::dataPath(sink);
-    const uint64_t first = numberAt(path, 0), second = numberAt(path, source.size - block_size);
-    EXPECT_TRUE(first == second || first == second + 1) << first << " and " << second;
-    EXPECT_GE(second, acknowledged);
-    EXPECT_LE(first, after + 1);
-}
-
 TEST_F(VirtualLunTest, AKilledSenderIsNoticedAndCanBeginAnew)
 {
     put(source, 0, randomText(200 * MiB, 1));
@@ -481,7 +439,7 @@ TEST_F(VirtualLunTest, WhatCannotBeBoundLeavesNothingBehind)
         << iscsi_host_last_error();
     EXPECT_EQ(bind(), NORV_ERR_NO_SUCH_LUN);
 
-    sink = create("small", NORV_LUN_TYPE_SINK, 128 * MiB);
+    sink = createLun("small", 128 * MiB, NORV_LUN_TYPE_SINK);
     EXPECT_EQ(bind(), NORV_ERR_LUN_SIZE);
     EXPECT_EQ(iscsihost::closeSink(sink.uuid, "", false), NORV_ERR_NO_SUCH_TARGET);
     const char *const uuid = vlun.c_str(), *const here = node.c_str();

@@ -3,7 +3,6 @@
 #include "tests/e2e/Initiator.h"
 #include "tests/e2e/OrderedWriter.h"
 
-#include "host/core/Process.h"
 #include "host/storage/LunStore.h"
 #include "host/storage/MapFile.h"
 #include "host/target/Service.h"
@@ -27,24 +26,8 @@ protected:
     void SetUp() override
     {
         Appliance::SetUp();
-        ASSERT_EQ(iscsihost::createVolume(root + "/xfs", 300 * MiB, root + "/image"), 0) << iscsi_host_last_error();
-        store.target = createTarget("store");
-        store.lun.type = NORV_LUN_TYPE_ADV;
-        store.lun.size = 64 * MiB;
-        snprintf(store.lun.name, sizeof store.lun.name, "lun");
-        snprintf(store.lun.location, sizeof store.lun.location, "%s/xfs", root.c_str());
-        ASSERT_EQ(NORViSCSILunCreate(&store.lun), 0) << iscsi_host_last_error();
-        map(store.lun, {store.target.tid});
-        mask(store.target.tid, alice, NORV_AUTHORITY_READ_WRITE);
-        mask(store.target.tid, bob, NORV_AUTHORITY_READ);
-    }
-
-    void TearDown() override
-    {
-        EXPECT_EQ(norvhost::stopService(), 0) << iscsi_host_last_error();
-        norvhost::ProgramResult result;
-        EXPECT_EQ(norvhost::runProgram({{"umount", root + "/xfs"}, {}, 60}, result), 0);
-        EXPECT_EQ(result.status, 0) << result.errors;
+        useXfs(300 * MiB);
+        store = createStore(64 * MiB, NORV_LUN_TYPE_ADV);
     }
 
     _tag_iscsi_snapshot_ take(const std::string &name)

@@ -16,9 +16,10 @@ TEST(IscsiName, IsLowerCaseAndOfAKnownForm)
     EXPECT_TRUE(normaliseName("iqn.2026-01.example:my_host", normal));
     EXPECT_FALSE(normaliseTargetName("iqn.2026-01.example:my_host", normal));
     normal = "untouched";
-    for (const char *bad : {"", "iqn.", "iqn.2026-00.example", "iqn.2026-1.example", "iqn.2026-01.", "iqn.2026-01..x",
-                            "iqn.2026-01.x.:y", "iqn.2026-01.example:a\n", "iqn.2026-01.example:a,b=c", "eui.0200",
-                            "naa.5200", "disk", "iqn.2026-01.example:\xc3\xa4"})
+    for (const char *bad :
+         {"", "iqn.", "iqn.2026-00.example", "iqn.2026-1.example", "iqn.2026-01.", "iqn.2026-01..x", "iqn.2026-01.x.:y",
+          "iqn.2026-01.example:a\n", "iqn.2026-01.example:a,b=c", "eui.0200", "iqn.2026-13.example",
+          "iqn.2026-01.example:a b", "naa.5200", "disk", "iqn.2026-01.example:\xc3\xa4"})
         EXPECT_FALSE(normaliseName(bad, normal)) << bad;
     EXPECT_FALSE(normaliseName(std::string_view("iqn.2026-01.example\0x", 21), normal));
     EXPECT_EQ(normal, "untouched");
