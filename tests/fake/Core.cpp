@@ -54,12 +54,10 @@ int fake::unfreedLists()
     return unfreed_lists;
 }
 
-int fake::pushText(NLIBC_SZ_LIST &list, const std::string &text)
+void fake::pushText(NLIBC_SZ_LIST &list, const std::string &text)
 {
-    if (list.count == list.capacity)
-        return -1;
-    list.texts[list.count] = strdup(text.c_str());
-    return list.texts[list.count] ? ++list.count : -1;
+    if (list.count < list.capacity)
+        list.texts[list.count++] = strdup(text.c_str());
 }
 
 namespace {
@@ -130,12 +128,6 @@ void NLIBCSzListFree(NLIBC_SZ_LIST *list)
     delete[] list->texts;
     delete list;
     --unfreed_lists;
-}
-
-int NLIBCSzListPush(NLIBC_SZ_LIST *list, const char *text)
-{
-    NOTE_CALL(text);
-    return pushText(*list, text);
 }
 
 const char *NLIBCSzListGet(const NLIBC_SZ_LIST *list, int index)

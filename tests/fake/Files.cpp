@@ -223,10 +223,8 @@ int NLIBCFileRemoveSection(const char *path, const char *section)
 int NLIBCFileEnumSection(const char *path, NLIBC_SZ_LIST *names)
 {
     NOTE_CALL(path);
-    for (const Section &section : model().section_files[path]) {
-        if (pushText(*names, section.name) < 0)
-            return -1;
-    }
+    for (const Section &section : model().section_files[path])
+        pushText(*names, section.name);
     return names->count;
 }
 

@@ -61,18 +61,16 @@ int NORVRETENTIONRunPolicy(const char *kind, const char *key, NORV_RETENTION_TAR
         return 0;
     std::vector<_tag_retention_target_> targets;
     _tag_retention_target_ *list = nullptr;
-    const int err = get(key, &list);
+    get(key, &list);
     while (_tag_retention_target_ *target = list) {
         targets.push_back(*target);
         list = target->next;
         free(target);
     }
-    if (err)
-        return -1;
     std::sort(targets.begin(), targets.end(), [](const auto &a, const auto &b) { return a.time > b.time; });
     for (size_t i = model().retention_keeps; i < targets.size(); ++i) {
-        if (!targets[i].protected_ && remove(key, &targets[i]))
-            return -1;
+        if (!targets[i].protected_)
+            remove(key, &targets[i]);
     }
     return 0;
 }
@@ -85,8 +83,6 @@ int NORVRETAINERiSCSIRetentionTargetGet(const char *key, _tag_retention_target_ 
         if (std::to_string(place.first) != key)
             continue;
         auto *target = static_cast<_tag_retention_target_ *>(calloc(1, sizeof(_tag_retention_target_)));
-        if (!target)
-            return NORV_ERR_OUT_OF_MEMORY;
         put(target->uuid, textOf(snapshot.record.uuid));
         target->time = snapshot.record.snap_time;
         target->protected_ = snapshot.record.user_locked || snapshot.is_locked || !snapshot.app_keys.empty();
@@ -99,12 +95,8 @@ int NORVRETAINERiSCSIRetentionTargetGet(const char *key, _tag_retention_target_ 
 int NORVRETAINERiSCSIRetentionTargetDelete(const char *key, const _tag_retention_target_ *target)
 {
     NOTE_CALL(key, target->uuid);
-    auto &snapshots = model().snapshots;
-    const auto found = std::find_if(snapshots.begin(), snapshots.end(), [&](const auto &entry) {
-        return textOf(entry.second.record.uuid) == target->uuid;
-    });
-    if (found == snapshots.end())
-        return NORV_ERR_NO_SUCH_SNAPSHOT;
-    snapshots.erase(found);
+    const auto is_meant = [&](const auto &record) { return strcmp(record.uuid, target->uuid) == 0; };
+    if (const Snapshot *known = firstOf(model().snapshots, is_meant))
+        model().snapshots.erase({known->record.lid, known->record.snap_id});
     return 0;
 }

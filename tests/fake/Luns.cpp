@@ -114,14 +114,11 @@ int fake::createLUN(_tag_iscsi_lun_ &lun)
 {
     if (int err = judge(lun))
         return err;
-    const int lid = freeID();
-    if (lid > NORV_LUN_ID_MAX)
-        return NORV_ERR_MAX_LUNS;
-    lun.lid = lid;
+    lun.lid = freeID();
     lun.options = 0;
     lun.restored_time = 0;
     makeUUID(lun.uuid);
-    model().luns[lid].record = lun;
+    model().luns[lun.lid].record = lun;
     return 0;
 }
 
@@ -140,8 +137,6 @@ int NORViSCSILunConfigGetAll(_tag_iscsi_lun_ **luns, size_t *count)
     if (known.empty())
         return 0;
     auto *records = static_cast<_tag_iscsi_lun_ *>(malloc(known.size() * sizeof(_tag_iscsi_lun_)));
-    if (!records)
-        return NORV_ERR_OUT_OF_MEMORY;
     *luns = records;
     for (const auto &[lid, lun] : known)
         *records++ = lun.record;
@@ -177,8 +172,6 @@ int NORViSCSILunDelete(_tag_iscsi_lun_ *lun)
     NOTE_CALL_ON(known, lun->uuid);
     if (isMapped(known->record.lid))
         return NORV_ERR_LUN_MAPPED;
-    if (known->is_locked)
-        return NORV_ERR_LUN_LOCKED;
     model().luns.erase(known->record.lid);
     return 0;
 }
@@ -193,8 +186,6 @@ int NORViSCSILunUpdate(_tag_iscsi_lun_ *lun)
         return NORV_ERR_LUN_NAME_EXISTS;
     if (!isSize(lun->size) || lun->size < known->record.size)
         return NORV_ERR_LUN_SIZE;
-    if (known->is_locked)
-        return NORV_ERR_LUN_LOCKED;
     put(known->record.name, lun->name);
     known->record.size = lun->size;
     return 0;
@@ -241,8 +232,6 @@ int NORViSCSIFamilyConfGetByLID(int lid, _tag_iscsi_family_ *family)
 int NORViSCSILunMappingsAdd(const int target_ids[], int lid, int count)
 {
     NOTE_CALL(idList(target_ids, count), lid, count);
-    if (!byID(lid))
-        return NORV_ERR_NO_SUCH_LUN;
     for (int i = 0; i < count; ++i) {
         if (model().targets.count(target_ids[i]) == 0)
             return NORV_ERR_NO_SUCH_TARGET;

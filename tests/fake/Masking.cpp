@@ -54,8 +54,6 @@ int changeAll(const Entries &entries, Change change)
 
 int setEntry(Target &target, const std::string &iqn, int permission)
 {
-    if (iqn.empty())
-        return NORV_ERR_TARGET_IQN;
     if (!isPermission(permission))
         return NORV_ERR_TARGET_PERMISSION;
     const auto entry = find(target, iqn);

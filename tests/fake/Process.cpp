@@ -77,22 +77,12 @@ extern "C" {
 
 #pragma GCC visibility push(default)
 
-void vsyslog(int priority, const char *format, va_list arguments)
-{
-    fake::note(priority, format, arguments);
-}
-
 void syslog(int priority, const char *format, ...)
 {
     va_list arguments;
     va_start(arguments, format);
     fake::note(priority, format, arguments);
     va_end(arguments);
-}
-
-void __vsyslog_chk(int priority, int, const char *format, va_list arguments)
-{
-    fake::note(priority, format, arguments);
 }
 
 void __syslog_chk(int priority, int, const char *format, ...)

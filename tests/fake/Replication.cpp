@@ -86,8 +86,6 @@ int NORViSCSIReplicationTaskConfLoad(const _tag_iscsi_task_selection_ *selection
     _tag_iscsi_task_ *last = head;
     for (const Task &task : model().tasks) {
         auto *record = static_cast<_tag_iscsi_task_ *>(malloc(sizeof(_tag_iscsi_task_)));
-        if (!record)
-            return NORV_ERR_OUT_OF_MEMORY;
         noteListed(record);
         *record = task.record;
         record->forward = nullptr;

@@ -128,8 +128,8 @@ inline bool isPlatforms(const std::string &path)
     return path.rfind("/usr/norv/", 0) == 0;
 }
 
-/// What NLIBCSzListPush does.
-int pushText(NLIBC_SZ_LIST &list, const std::string &text);
+/// Appends to a list of texts while it has room.
+void pushText(NLIBC_SZ_LIST &list, const std::string &text);
 
 /// A record of a listing, from the C allocator, that counts as unfreed until noteFreed() sees it.
 void noteListed(const void *memory);

@@ -85,8 +85,6 @@ int NORViSCSISnapshotConfLoad(const _tag_iscsi_snapshot_query_ *query, _tag_iscs
         if (!isAsked(*query, snapshot.record))
             continue;
         auto *record = static_cast<_tag_iscsi_snapshot_ *>(malloc(sizeof(_tag_iscsi_snapshot_)));
-        if (!record)
-            return NORV_ERR_OUT_OF_MEMORY;
         noteListed(record);
         *record = snapshot.record;
         record->previous = list->last;
@@ -112,10 +110,8 @@ int NORViSCSISnapshotLockedAppKeysGet(const _tag_iscsi_snapshot_ *snapshot, NLIB
 {
     const Snapshot *known = byUUID(snapshot->uuid);
     NOTE_CALL_ON(known, snapshot->uuid);
-    for (const auto &key : known->app_keys) {
-        if (pushText(*keys, key) < 0)
-            return NORV_ERR_OUT_OF_MEMORY;
-    }
+    for (const auto &key : known->app_keys)
+        pushText(*keys, key);
     return 0;
 }
 
@@ -162,10 +158,6 @@ int NORViSCSISnapshotCreate(const _tag_iscsi_lun_ *lun, _tag_iscsi_snapshot_ *sn
     if (!isName(snapshot->name, sizeof(snapshot->name) - 1) || byName(lid, snapshot->name))
         return NORV_ERR_SNAPSHOT_NAME;
     const int number = freeNumber(lid);
-    if (number > NORV_SNAPSHOT_ID_MAX)
-        return NORV_ERR_MAX_SNAPSHOTS;
-    if (known->is_locked)
-        return NORV_ERR_LUN_LOCKED;
     snapshot->snap_id = number;
     makeUUID(snapshot->uuid);
     makeUUID(snapshot->version);
@@ -197,8 +189,6 @@ int NORViSCSISnapshotRestore(const _tag_iscsi_snapshot_ *snapshot, const _tag_is
     LUN *restored = findLUN(lun->uuid);
     if (!known || !restored || known->record.lid != restored->record.lid)
         return NORV_ERR_NO_SUCH_SNAPSHOT;
-    if (restored->is_locked)
-        return NORV_ERR_LUN_LOCKED;
     restored->record.restored_time = 1700000000;
     return 0;
 }

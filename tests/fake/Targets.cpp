@@ -159,8 +159,6 @@ int NORViSCSITargetCreate(_tag_iscsi_target_ *target)
     int tid = 1;
     while (byID(tid))
         ++tid;
-    if (tid > NORV_TARGET_ID_MAX)
-        return NORV_ERR_MAX_TARGETS;
     target->tid = tid;
     model().targets[tid].record = *target;
     return 0;

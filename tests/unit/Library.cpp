@@ -27,16 +27,6 @@ std::string takeUntil(std::string &text, char delimiter)
     return taken;
 }
 
-/// One failure is told with the addresses of its arguments.
-std::string withoutAddresses(const std::string &text)
-{
-    void *query = nullptr, *list = nullptr;
-    int end = 0;
-    if (sscanf(text.c_str(), "NORViSCSISnapshotConfLoad(%p, %p)%n", &query, &list, &end) != 2 || !query || !list)
-        return text;
-    return "NORViSCSISnapshotConfLoad({addresses})" + text.substr(static_cast<size_t>(end));
-}
-
 std::string withoutPlace(const fake::LogLine &line)
 {
     const std::string tag = "[E] iSCSIWebAPI:";
@@ -57,7 +47,7 @@ std::string withoutPlace(const fake::LogLine &line)
     const char behind_number = text[digits];
     text.erase(0, digits + 1);
     const std::string method = behind_number == ':' ? takeUntil(text, ' ') : "";
-    return (is_tagged ? "[E] " : line.priority == LOG_INFO ? "[info] " : "") + method + ": " + withoutAddresses(text);
+    return (is_tagged ? "[E] " : line.priority == LOG_INFO ? "[info] " : "") + method + ": " + text;
 }
 
 std::set<std::string> written;

@@ -14,10 +14,8 @@ namespace unit {
 
 using Lines = std::vector<std::string>;
 
-/// What a failing platform call returns, and how it stands in a log line.
+/// What a failing platform call returns.
 constexpr int INJECTED = 18990999;
-const char *const INJECTED_TEXT = "Unknown error 18990999";
-const char *const INJECTED_ERROR = "18990999 (Unknown error 18990999)";
 
 /// Secrets of the targets that addTarget makes. No log line of any test may hold one.
 const char *const SECRET = "opensesame-in";
@@ -33,7 +31,7 @@ protected:
 
 /// Log lines since the last call, once detached workers have ended: "method: text" for "file:line:method text", ":
 /// text" for a head without method, "[E] method: text" for the tagged form, "[info] method: text" for a line that is no
-/// failure; addresses stand as {addresses}.
+/// failure.
 Lines logged();
 
 /// Platform calls since the last call, once detached workers have ended, as "Name(arguments)"; those whose names begin

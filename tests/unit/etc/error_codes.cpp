@@ -8,23 +8,6 @@
 
 namespace {
 
-TEST(ErrorCodes, RangesCoverTheTableWithoutGapsOrOverlaps)
-{
-    int next_index = 0;
-    int last = 0;
-    for (const auto &range : ISCSI::error_table::ranges) {
-        EXPECT_GT(range.first, last);
-        EXPECT_EQ(range.index, next_index);
-        next_index += range.last - range.first + 1;
-        last = range.last;
-    }
-    EXPECT_EQ(next_index, 366);
-    for (const char *text : ISCSI::error_table::texts) {
-        ASSERT_NE(text, nullptr);
-        EXPECT_STRNE(text, "");
-    }
-}
-
 TEST(ErrorCodes, OwnCodesHaveTheirTexts)
 {
     // The ends of every range, so that a text too many or too few shows, and texts whose odd spelling is interface.

@@ -45,7 +45,7 @@ protected:
     Clone clone;
 
     const std::string removed = "NORViSCSIVirtualLunRemove(" + VLUN + ")";
-    const std::string deleted = "WebAPIClientLUNDelete(peer.example, " + MADE + ")";
+    const std::string deleted = "WebAPIClientLUNDelete(peer.example, /luns/" + MADE + ")";
 };
 
 TEST_F(RemoteClone, WithoutAWatcherItEndsWithTheBinding)
@@ -53,12 +53,14 @@ TEST_F(RemoteClone, WithoutAWatcherItEndsWithTheBinding)
     EXPECT_EQ(clone.run(false), 0);
     EXPECT_EQ(clone.vlun_uuid, VLUN);
     EXPECT_EQ(clone.dst_lun_uuid, MADE);
-    EXPECT_EQ(called(),
-              (Lines{"NORViSCSILunConfigGetByUUID(" + UUID + ", 0)", "NORViSCSIVirtualLunCreate(" + UUID + ", 2, 0)",
-                     "WebAPIClientLUNCreate(peer.example, copy, 31, /volume2, 1073741824, 8192)",
-                     std::string("DRNodeDB::Get(") + PEER_NODE + ")",
-                     std::string("DRNodeDB::ListAttr(") + PEER_NODE + ", NORV.iSCSI)",
-                     "NORViSCSIVirtualLunBindSink(" + VLUN + ", a:3260, " + PEER_NODE + ", " + MADE + ")"}));
+    EXPECT_EQ(
+        called(),
+        (Lines{"NORViSCSILunConfigGetByUUID(" + UUID + ", 0)", "NORViSCSIVirtualLunCreate(" + UUID + ", 2, 0)",
+               R"(WebAPIClientLUNCreate(peer.example, /luns, {"extent_size":8192,"location":"/volume2","name":"copy",)"
+               R"("size":1073741824,"type":31}))",
+               std::string("DRNodeDB::Get(") + PEER_NODE + ")",
+               std::string("DRNodeDB::ListAttr(") + PEER_NODE + ", NORV.iSCSI)",
+               "NORViSCSIVirtualLunBindSink(" + VLUN + ", a:3260, " + PEER_NODE + ", " + MADE + ")"}));
     EXPECT_EQ(fake::model().virtual_luns.size(), 1u) << "the virtual LUN stays";
 }
 

@@ -19,6 +19,12 @@ const Failures LOADED = {{"DRNodeDB::Get", 18991112}, {"DRNodeDB::ListAttr", 0, 
 const Failures LOCKED = LOADED + Failures{{"NORVFSMkdirP", 18990028},
                                           {"NLIBCFileLockByFile", 18990808},
                                           {"NLIBCFileUnlockByFile", 0, Then::ONLY_THE_LOG_TELLS}};
+/// Sending, which the worker ends.
+const Failures SENT = LOCKED + Failures{{"NORViSCSISnapshotConfLoad", 18990573},
+                                        {"NLIBCProcForkChildNoWait", 18990014},
+                                        {"NORViSCSIReplicationTaskProgressGetByTask WebAPIClientLUNTakeSnapshot "
+                                         "WebAPIClientLUNGetSnapshot",
+                                         0, Then::ONLY_THE_LOG_TELLS}};
 const Failures MAPPING = {{"NORViSCSIConfGet", 18990557}};
 
 void sourceBehind()
@@ -104,19 +110,10 @@ const Operation operations[] = {
         theTask, "checkNode", sourceSide,
         [](auto &task, auto &) { return task.checkNode(PEER_NODE, "10.0.0.9", 3262); }, "",
         LOADED + Failures{{"DRNodeDB::SetAttr", 18991118}}),
-    on(theTask, "sendSnapshot", sourceSide, send, "",
-       LOCKED + Failures{{"NORViSCSISnapshotConfLoad", 18990573},
-                         {"NLIBCProcForkChildNoWait", 18990014},
-                         {"NORViSCSIReplicationTaskProgressGetByTask WebAPIClientLUNTakeSnapshot "
-                          "WebAPIClientLUNGetSnapshot",
-                          0, Then::ONLY_THE_LOG_TELLS}}),
+    on(theTask, "sendSnapshot", sourceSide, send, "", SENT),
     on(theTask, "sendSnapshotNotAligned", sourceBehind, send, "",
-       LOCKED + Failures{{"NORViSCSISnapshotConfLoad", 18990573},
-                         {"NLIBCProcForkChildNoWait", 18990014},
-                         {"WebAPIClientLUNGet WebAPIClientLUNSet NORViSCSIReplicationTaskSendSnapshot "
-                          "NORViSCSIReplicationTaskProgressGetByTask WebAPIClientLUNTakeSnapshot "
-                          "WebAPIClientLUNGetSnapshot",
-                          0, Then::ONLY_THE_LOG_TELLS}}),
+       SENT + Failures{{"WebAPIClientLUNGet WebAPIClientLUNSet NORViSCSIReplicationTaskSendSnapshot", 0,
+                        Then::ONLY_THE_LOG_TELLS}}),
     on(theTask, "getReplicationBaseVersion", alignedDestination, chooseBase, " other", LOCKED),
     on(
         theTask, "startToComputeUnsyncSize", sourceSide,

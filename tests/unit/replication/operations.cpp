@@ -100,12 +100,15 @@ TEST_F(Replication, CreatingMakesALUNAndATaskOnBothSides)
     EXPECT_EQ(creation.task.uuid, record.uuid);
     EXPECT_EQ(record.is_source, 1);
     EXPECT_STREQ(record.root_path, "/volume1");
-    const std::string poll = "WebAPIClientLUNGet(peer.example, " + MADE + ", {is_action_locked})";
-    EXPECT_EQ(called({"WebAPI"}),
-              (Lines{"WebAPIClientLUNCreate(peer.example, copy, 31, /volume2, 1073741824, 8192)", poll, poll, poll,
-                     "WebAPIClientNodeGet(peer.example, peer.example)",
-                     "WebAPIClientReplicationCreateTask(peer.example, " + creation.task.uuid + ", destination, " +
-                         SOURCE + ", " + MADE + ", " + LOCAL_NODE + ", " + PEER_NODE + ")"}));
+    const std::string poll = "WebAPIClientLUNGet(peer.example, /luns/" + MADE + ")";
+    EXPECT_EQ(
+        called({"WebAPI"}),
+        (Lines{R"(WebAPIClientLUNCreate(peer.example, /luns, {"extent_size":8192,"location":"/volume2",)"
+               R"("name":"copy","size":1073741824,"type":31}))",
+               poll, poll, poll, "WebAPIClientNodeGet(peer.example, peer.example)",
+               R"(WebAPIClientReplicationCreateTask(peer.example, /replications/tasks, {"dst_lun_uuid":")" + MADE +
+                   R"(","dst_node_uuid":")" + PEER_NODE + R"(","is_source":false,"src_lun_uuid":")" + SOURCE +
+                   R"(","src_node_uuid":")" + LOCAL_NODE + R"(","uuid":")" + creation.task.uuid + "\"})"}));
     const auto &keys = fake::model().node_attributes;
     ASSERT_EQ(keys.size(), 2u);
     EXPECT_EQ(keys[0].node_id + keys[0].value, std::string(PEER_NODE) + "peer-rod-key");
@@ -137,6 +140,13 @@ TEST_F(Replication, CreatingRefusesBadInputBeforeAnythingIsSent)
     ISCSILIBReplication thin(SOURCE, LOCAL_NODE, PEER_NODE, "/volume2", "copy");
     EXPECT_EQ(thin.createReplication(), 18990500);
     EXPECT_EQ(called({"WebAPI"}), Lines());
+
+    noTask();
+    fake::failCall("WebAPIClientReplicationCreateTask", 1, INJECTED);
+    fake::failCall("WebAPIClientLUNDelete", 1, 5);
+    ISCSILIBReplication refused(SOURCE, LOCAL_NODE, PEER_NODE, "/volume2", "copy");
+    EXPECT_EQ(refused.createReplication(), INJECTED) << "whatever becomes of the clean-up";
+    EXPECT_TRUE(fake::model().tasks.empty());
 }
 
 TEST_F(Replication, WaitsOnThePeerPollOnceASecond)
@@ -178,10 +188,9 @@ TEST_F(Replication, WaitsOnThePeerPollOnceASecond)
         EXPECT_EQ(fake::secondsSlept(), c.seconds);
         EXPECT_EQ(logged(), c.head.empty() ? Lines() : Lines{line(c.head, c.error)});
     }
-    EXPECT_EQ(called({"WebAPI"}).back(), "WebAPIClientLUNGet(peer.example, " + DESTINATION + ", {is_action_locked})");
+    EXPECT_EQ(called({"WebAPI"}).back(), "WebAPIClientLUNGet(peer.example, /luns/" + DESTINATION + ")");
     replication.waitUntilRemoteSnapshotSyncDone("S", 1);
-    EXPECT_EQ(called({"WebAPI"}).back(),
-              "WebAPIClientLUNGetSnapshot(peer.example, S, {is_action_locked sync_progress})");
+    EXPECT_EQ(called({"WebAPI"}).back(), "WebAPIClientLUNGetSnapshot(peer.example, /snapshots/S)");
 }
 
 TEST_F(Replication, StatusTellsWhetherTheTaskIsLocked)

@@ -41,13 +41,20 @@ protected:
         return "[E] sendSnapshot: error code: " + shown(error) + " [" + replication.task.toString() + "]";
     }
 
-    const std::string asked =
-        "WebAPIClientReplicationGetBaseVersion(peer.example, " + TASK + ", {" + SNAPSHOT + " " + BASE + "})";
-    const std::string resized = "WebAPIClientLUNSet(peer.example, " + DESTINATION + ", , 1073741824)";
-    const std::string taken = "WebAPIClientLUNTakeSnapshot(peer.example, " + DESTINATION +
-                              ", true, true, , before the move, alice, 1234571492, false)";
-    const std::string polled = "WebAPIClientLUNGetSnapshot(peer.example, 22222222-0000-4000-8000-000000000002, "
-                               "{is_action_locked sync_progress})";
+    static std::string listed(const std::string &snapshot)
+    {
+        return R"({"uuid":")" + snapshot + R"(","version":")" + snapshotUUIDOf(3, 9999) + "\"}";
+    }
+
+    const std::string asked = "WebAPIClientReplicationGetBaseVersion(peer.example, /replications/" + TASK +
+                              R"(/base-version, {"snapshots":[)" + listed(SNAPSHOT) + "," + listed(BASE) + "]})";
+    const std::string resized = "WebAPIClientLUNSet(peer.example, /luns/" + DESTINATION + R"(, {"size":1073741824}))";
+    const std::string taken = "WebAPIClientLUNTakeSnapshot(peer.example, /luns/" + DESTINATION +
+                              R"(/snapshots, {"description":"before the move","is_app_consistent":true,)"
+                              R"("is_scheduled":false,"is_user_locked":true,"snapshot_time":1234571492,)"
+                              R"("taken_by":"alice"}))";
+    const std::string polled =
+        "WebAPIClientLUNGetSnapshot(peer.example, /snapshots/22222222-0000-4000-8000-000000000002)";
 };
 
 TEST_F(Sending, AWorkerFollowsTheTransferAndTakesTheSnapshotOnThePeer)
@@ -88,8 +95,7 @@ TEST_F(Sending, WaitsForThePeerToSetItsLUNBack)
     fake::model().peer.not_aligned = true;
     fake::model().peer.states.values = {{true, 0}, {false, 0}};
     EXPECT_EQ(send(), 0);
-    const std::string waited =
-        "WebAPIClientLUNGet(peer.example, " + DESTINATION + ", {is_action_locked sync_progress})";
+    const std::string waited = "WebAPIClientLUNGet(peer.example, /luns/" + DESTINATION + ")";
     EXPECT_EQ(sent(), (Lines{asked, waited, waited, resized, sending(BASE, "difference, encrypted, not the last try"),
                              taken, polled}));
     EXPECT_EQ(logged(), Lines{line("Base snapshot and LUN are not aligned. base: " + BASE, 0)});

@@ -16,16 +16,15 @@ using VirtualLUNs = LibraryTest;
 TEST_F(VirtualLUNs, OnlyKindOneIsCreated)
 {
     addLUN(3, "vol1");
-    const std::string record = " ,src_lun_uuid: " + UUID;
     const struct {
         unsigned int type;
         int code;
         Lines lines;
     } cases[] = {
-        {0, 18991000, {"createVLUN: Bad vLUN type. vLUN: uuid:  ,type: 0" + record}},
+        {0, 18991000, {"createVLUN: Bad vLUN type. vLUN: uuid:  ,type: 0 ,src_lun_uuid: " + UUID}},
         {2, 18990004, {"createVLUN: doCreate: Coming soooooooooooon T_T"}},
         {3, 18990004, {"createVLUN: doCreate: Coming soooooooooooon T_T"}},
-        {7, 18991000, {"createVLUN: No such type. vLUN: uuid:  ,type: 7" + record + "."}},
+        {7, 18991000, {"createVLUN: No such type. vLUN: uuid:  ,type: 7 ,src_lun_uuid: " + UUID + "."}},
     };
     for (const auto &c : cases) {
         ISCSILIBVLUN vlun(static_cast<_tag_iscsi_vlun_type>(c.type), UUID);
