@@ -6,9 +6,12 @@
 #include "host/state/StoreError.h"
 #include "platform/error.h"
 
+#include <algorithm>
 #include <cassert>
 #include <cerrno>
+#include <chrono>
 #include <fcntl.h>
+#include <poll.h>
 #include <pthread.h>
 #include <sqlite3.h>
 #include <unistd.h>
@@ -17,7 +20,24 @@
 namespace norvhost {
 namespace {
 
-constexpr int busy_timeout_ms = 30000;
+/// Writers do not queue: who is out of luck waits for many of the others' turns, each with its flush.
+constexpr auto busy_limit = std::chrono::seconds(90);
+constexpr int longest_pause_ms = 10;
+
+/// For sqlite3_busy_handler(). SQLite's own pauses for up to a tenth of a second, in which those who just came take
+/// turn after turn.
+int waitForOthers(void *, int calls)
+{
+    using Clock = std::chrono::steady_clock;
+    thread_local Clock::time_point begin;
+    const auto now = Clock::now();
+    if (calls == 0)
+        begin = now;
+    if (now - begin >= busy_limit)
+        return 0;
+    poll(nullptr, 0, std::min(calls + 1, longest_pause_ms));
+    return 1;
+}
 
 struct KeptStatement {
     sqlite3_stmt *statement = nullptr;
@@ -67,7 +87,7 @@ int openConnection()
     if (int result = sqlite3_open_v2(path.c_str(), &handle, flags, nullptr))
         return storeError(handle, result, ("cannot open the state " + path).c_str());
     sqlite3_extended_result_codes(handle, 1);
-    sqlite3_busy_timeout(handle, busy_timeout_ms);
+    sqlite3_busy_handler(handle, waitForOthers, nullptr);
     const char *const settings = "PRAGMA journal_mode = WAL; PRAGMA synchronous = FULL; PRAGMA foreign_keys = ON";
     if (int result = sqlite3_exec(handle, settings, nullptr, nullptr, nullptr))
         return storeError(handle, result, ("cannot open the state " + path).c_str());

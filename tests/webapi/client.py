@@ -23,7 +23,7 @@ class Client:
 
     def __init__(self, pem=None, port=5443, source=None):
         context = ssl.create_default_context(cafile=pem) if pem else ssl._create_unverified_context()
-        self.connection = http.client.HTTPSConnection("localhost", port, timeout=60, context=context, source_address=source)
+        self.connection = http.client.HTTPSConnection("localhost", port, timeout=300, context=context, source_address=source)
         self.headers = {}
         self.used = time.monotonic()
 
