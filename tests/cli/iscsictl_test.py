@@ -217,9 +217,6 @@ class Completion(Appliance):
                                 capture_output=True, text=True, check=True)
         return [line for line in result.stdout.splitlines() if line]
 
-    def test_script_is_valid(self):
-        subprocess.run(["bash", "-n", self.script], check=True)
-
     def test_words_come_from_the_definitions(self):
         self.assertEqual(self.complete(""), ["lun", "snapshot", "retention", "schedule", "events", "target", "node", "vlun",
                                              "replication", "login", "logout", "completion"])

@@ -2,7 +2,6 @@
 #include "tests/e2e/Appliance.h"
 
 #include "host/core/FileDescriptor.h"
-#include "host/core/Process.h"
 #include "host/replication/Roles.h"
 #include "host/replication/TaskStore.h"
 #include "host/services/Identity.h"
@@ -11,7 +10,6 @@
 #include "host/storage/MapFile.h"
 #include "host/storage/SnapshotStore.h"
 #include "host/storage/Versions.h"
-#include "host/target/Service.h"
 #include "iscsihost/replication.h"
 #include "platform/error.h"
 
@@ -33,25 +31,13 @@ protected:
     {
         Appliance::SetUp();
         ASSERT_EQ(norvhost::makeIdentity(), 0) << iscsi_host_last_error();
-        ASSERT_EQ(iscsihost::createVolume(root + "/xfs", 1000 * MiB, root + "/image"), 0) << iscsi_host_last_error();
-        lun.type = NORV_LUN_TYPE_SINK;
-        lun.size = 64 * MiB;
-        setText(lun.name, "copy");
-        setText(lun.location, root + "/xfs");
-        ASSERT_EQ(NORViSCSILunCreate(&lun), 0) << iscsi_host_last_error();
+        useXfs(1000 * MiB);
+        lun = createLun("copy", 64 * MiB, NORV_LUN_TYPE_SINK);
         norvhost::TaskRow task;
         setText(task.record.uuid, task_uuid);
         setText(task.record.src_lun_uuid, "bbbbbbbb-0000-4000-8000-000000000000");
         setText(task.record.dst_lun_uuid, lun.uuid);
         ASSERT_EQ(norvhost::insertTask(task), 0) << iscsi_host_last_error();
-    }
-
-    void TearDown() override
-    {
-        EXPECT_EQ(norvhost::stopService(), 0) << iscsi_host_last_error();
-        norvhost::ProgramResult result;
-        EXPECT_EQ(norvhost::runProgram({{"umount", root + "/xfs"}, {}, 60}, result), 0);
-        EXPECT_EQ(result.status, 0) << result.errors;
     }
 
     Reception begin(const std::string &version, const std::string &base)

@@ -99,11 +99,9 @@ TEST_F(TargetTest, BadRequestsAreRefusedByFieldAndChangeNothing)
         Change change;
     } bad[] = {
         {NORV_ERR_TARGET_NAME, text(&_tag_iscsi_target_::name, "a/b")},
-        {NORV_ERR_TARGET_NAME, text(&_tag_iscsi_target_::name, "first")},
         {NORV_ERR_TARGET_IQN, iqnIs("iqn.2026-01.example:FIRST")},
         {NORV_ERR_TARGET_IQN, iqnIs("iqn.2026-01.example:a\nTarget 7: x")},
         {NORV_ERR_TARGET_IQN, iqnIs(long_name + "x")},
-        {NORV_ERR_TARGET_AUTH_TYPE, [](auto &t) { t.auth_type = 0xffffffff; }},
         {NORV_ERR_TARGET_MAX_SESSIONS, [](auto &t) { t.max_sessions = 65536; }},
         {NORV_ERR_BAD_PARAMETER, [](auto &t) { t.max_recv_seg_bytes = 511; }},
         {NORV_ERR_BAD_PARAMETER, [](auto &t) { t.max_send_seg_bytes = 1 << 24; }},
