@@ -156,6 +156,29 @@ bool takeLine(Lines &lines, std::string_view text)
     return take(lines, text, rest) && rest.empty();
 }
 
+/// What stands behind the prefix, on each line that begins with it.
+std::vector<std::string_view> valuesOf(std::string_view text, std::string_view prefix)
+{
+    std::vector<std::string_view> values;
+    std::string_view value;
+    for (Lines lines(text); !lines.atEnd();)
+        if (take(lines, prefix, value))
+            values.push_back(value);
+        else
+            lines.next();
+    return values;
+}
+
+/// "<ID>: <name>"
+bool parseHeader(std::string_view header, int &tid, std::string &iqn)
+{
+    const size_t colon = header.find(": ");
+    if (colon == header.npos || !parseNumber(header.substr(0, colon), tid))
+        return false;
+    iqn = header.substr(colon + 2);
+    return true;
+}
+
 bool takeNexuses(Lines &lines, std::vector<uint64_t> &nexuses)
 {
     std::string_view ignored;
@@ -210,15 +233,8 @@ void takeTexts(Lines &lines, std::vector<std::string> &texts)
 bool takeTarget(Lines &lines, TgtdTarget &target)
 {
     std::string_view header, value;
-    uint64_t tid;
-    if (!take(lines, "Target ", header))
+    if (!take(lines, "Target ", header) || !parseHeader(header, target.tid, target.iqn))
         return false;
-    const size_t colon = header.find(": ");
-    if (colon == header.npos || !parseNumber(header.substr(0, colon), tid))
-        return false;
-    target.tid = static_cast<int>(tid);
-    target.iqn = header.substr(colon + 2);
-
     if (!takeLine(lines, "    System information:") || !takeLine(lines, "        Driver: iscsi") ||
         !take(lines, "        State: ", value))
         return false;
@@ -240,17 +256,11 @@ bool takeTarget(Lines &lines, TgtdTarget &target)
 /// The targets in the driver's own list, a text that no initiator has a part in.
 bool parseDriverTargets(std::string_view text, std::vector<std::pair<int, std::string>> &targets)
 {
-    for (Lines lines(text); !lines.atEnd();) {
-        std::string_view header;
-        uint64_t tid;
-        if (!take(lines, "        Target ", header)) {
-            lines.next();
-            continue;
-        }
-        const size_t colon = header.find(": ");
-        if (colon == header.npos || !parseNumber(header.substr(0, colon), tid))
+    for (const std::string_view header : valuesOf(text, "        Target ")) {
+        std::pair<int, std::string> target;
+        if (!parseHeader(header, target.first, target.second))
             return false;
-        targets.emplace_back(static_cast<int>(tid), header.substr(colon + 2));
+        targets.push_back(std::move(target));
     }
     std::sort(targets.begin(), targets.end());
     return true;
@@ -420,14 +430,8 @@ int Tgtd::showUsers(std::vector<std::string> &users) const
     std::string text;
     if (int err = call({mode_account, op_show}, &text))
         return err;
-    users.clear();
-    for (Lines lines(text); !lines.atEnd();) {
-        std::string_view user;
-        if (take(lines, "    ", user))
-            users.emplace_back(user);
-        else
-            lines.next();
-    }
+    const auto values = valuesOf(text, "    ");
+    users.assign(values.begin(), values.end());
     return 0;
 }
 
@@ -437,13 +441,8 @@ int Tgtd::showPortals(std::vector<std::string> &portals) const
     if (int err = call({mode_portal, op_show}, &text))
         return err;
     portals.clear();
-    for (Lines lines(text); !lines.atEnd();) {
-        std::string_view portal;
-        if (take(lines, "Portal: ", portal))
-            portals.emplace_back(portal.substr(0, portal.rfind(',')));
-        else
-            lines.next();
-    }
+    for (const std::string_view portal : valuesOf(text, "Portal: "))
+        portals.emplace_back(portal.substr(0, portal.rfind(',')));
     std::sort(portals.begin(), portals.end());
     return 0;
 }
