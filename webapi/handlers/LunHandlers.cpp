@@ -133,16 +133,18 @@ Result listLuns(const Request &request)
     Result result;
     result.value = Json::arrayValue;
     for (ISCSILUNInfo &lun : luns) {
+        _tag_iscsi_lun_ record{};
+        const int err = with_status ? lun.loadStatus(record) : 0;
+        if (err == ERR_NO_SUCH_LUN) // deleted since it was listed
+            continue;
+        if (err)
+            return failed(err);
         Json::Value &out = result.value.append(Json::objectValue);
+        lun.toJsonFormat(out);
         if (with_status) {
-            _tag_iscsi_lun_ record{};
-            if (int err = lun.loadStatus(record))
-                return failed(err);
-            lun.toJsonFormat(out);
             addAllocatedSize(lun, record, out);
             continue;
         }
-        lun.toJsonFormat(out);
         // What was not asked for is left out rather than wrong.
         for (const char *key : {"status", "allocated_size", "is_action_locked"})
             out.removeMember(key);
