@@ -177,13 +177,21 @@ int status(Status &status)
         return err;
     if (int err = countTargets(now.targets))
         return err;
+    std::vector<int> suspects;
     const auto look_at = [&](const LunRow &row) {
         ++now.luns;
         if (checkData(row.record) != 0)
-            now.unhealthy.push_back({row.record.lid, row.record.name, lastError()});
+            suspects.push_back(row.record.lid);
     };
     if (int err = forEachLun(look_at))
         return err;
+    for (const int lid : suspects) {
+        // What an action was just moving or removing is not missing.
+        LunRow row;
+        bool busy = false;
+        if (lunLockHeld(lid, busy) == 0 && !busy && loadLunByLid(lid, row) == 0 && checkData(row.record) != 0)
+            now.unhealthy.push_back({lid, row.record.name, lastError()});
+    }
     now.service_alive = iscsiServiceAlive();
     now.tls_problem = tlsProblem();
     now.tls_port = now.tls_problem.empty() ? tls_port : 0;

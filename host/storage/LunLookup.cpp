@@ -129,8 +129,12 @@ int NORViSCSIFamilyConfGetByLID(int lid, _tag_iscsi_family_ *family)
         return fail(NORV_ERR_NO_SUCH_FAMILY, "there is no LUN %d", lid);
     if (err)
         return err;
+    // What an action is just moving or removing is not missing; has it ended, all is where the row says now.
+    bool healthy = isHealthy(row), busy = false;
+    if (!healthy && lunLockHeld(lid, busy) == 0 && !busy)
+        healthy = loadLunByLid(lid, row) != 0 || isHealthy(row);
     *family = _tag_iscsi_family_();
     family->lid = lid;
-    snprintf(family->status, sizeof family->status, "%s", isHealthy(row) ? "Healthy" : "Unhealthy");
+    snprintf(family->status, sizeof family->status, "%s", healthy || busy ? "Healthy" : "Unhealthy");
     return 0;
 }
