@@ -25,7 +25,10 @@ int missingArgument(const char *function)
 
 void setStatus(_tag_iscsi_snapshot_ &snapshot)
 {
-    copyText(snapshot.status, checkSnapshotData(snapshot) == 0 ? "Healthy" : "Unhealthy");
+    bool healthy = checkSnapshotData(snapshot) == 0;
+    if (!healthy) // what an action is just moving or removing is not missing
+        snapshotLockHeld(snapshot.lid, snapshot.snap_id, healthy);
+    copyText(snapshot.status, healthy ? "Healthy" : "Unhealthy");
 }
 
 int answer(int err, const SnapshotRow &row, _tag_iscsi_snapshot_ *snapshot)

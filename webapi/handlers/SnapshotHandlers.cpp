@@ -135,7 +135,13 @@ Result listSnapshots(const Request &request)
     }
     Result result;
     result.value = Json::arrayValue;
-    for (const ISCSISnapshotInfo &snapshot : snapshots) {
+    for (ISCSISnapshotInfo &snapshot : snapshots) {
+        // Its data may have been moved or removed since it was listed.
+        const int err = snapshot.status == "Unhealthy" ? snapshot.loadFromConfig(ALL_FACTS) : 0;
+        if (err == ERR_NO_SUCH_SNAPSHOT)
+            continue;
+        if (err)
+            return failed(err);
         Json::Value &out = result.value.append(Json::Value());
         snapshot.toJsonFormat(out);
         out["lun_name"] = names[snapshot.parent_lun_id];
