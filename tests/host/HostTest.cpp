@@ -155,6 +155,17 @@ int waitForChild(pid_t child)
     return WIFSIGNALED(status) ? 128 + WTERMSIG(status) : WEXITSTATUS(status);
 }
 
+int inChildren(int count, const std::function<int(int)> &work)
+{
+    std::vector<pid_t> children;
+    for (int number = 0; number < count; ++number)
+        children.push_back(inChild([&] { return work(number); }));
+    int sum = 0;
+    for (const pid_t child : children)
+        sum += waitForChild(child);
+    return sum;
+}
+
 bool exists(const std::string &path)
 {
     return access(path.c_str(), F_OK) == 0;

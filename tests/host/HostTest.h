@@ -71,6 +71,8 @@ struct Zone {
 pid_t inChild(const std::function<int()> &work);
 /// Its exit status, 128 + n when signal n ended it.
 int waitForChild(pid_t child);
+/// Runs the function, which gets its number, in so many processes at once; returns the sum of their exit statuses.
+int inChildren(int count, const std::function<int(int)> &work);
 
 bool exists(const std::string &path);
 void setName(_tag_iscsi_lun_ &lun, const std::string &name);

@@ -26,17 +26,13 @@ TEST_F(IdentityTest, IsMadeOnceByWhoeverComesFirst)
     EXPECT_EQ(0, NORVCheckModule("iscsi_rodsp"));
 
     closeDatabase();
-    std::vector<pid_t> makers;
-    for (int i = 0; i < 8; ++i)
-        makers.push_back(inChild([i, this] {
-            std::string made, rod_key;
-            if (iscsihost::init(made) || localRodKey(rod_key))
-                return 1;
-            std::ofstream(root + "/made-" + std::to_string(i)) << made << rod_key;
-            return 0;
-        }));
-    for (const pid_t maker : makers)
-        EXPECT_EQ(0, waitForChild(maker));
+    EXPECT_EQ(0, inChildren(8, [&](int i) {
+                  std::string made, rod_key;
+                  if (iscsihost::init(made) || localRodKey(rod_key))
+                      return 1;
+                  std::ofstream(root + "/made-" + std::to_string(i)) << made << rod_key;
+                  return 0;
+              }));
     ASSERT_EQ(0, iscsihost::init(id));
     ASSERT_EQ(0, NORVExtentPoolRODKeyGet(key, sizeof key)) << iscsi_host_last_error();
     EXPECT_EQ(36u, id.size());

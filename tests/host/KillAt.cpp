@@ -50,22 +50,7 @@ bool beginsAChange(pid_t child)
     }
 }
 
-} // namespace
-
-StateKeeper::StateKeeper()
-    : process(inChild([] {
-          openDatabase();
-          return pause();
-      }))
-{
-}
-
-StateKeeper::~StateKeeper()
-{
-    kill(process, SIGKILL);
-    waitpid(process, nullptr, 0);
-}
-
+/// Kills a process of its own before the n-th such call of the work; false when the work ended before.
 bool killAtSystemCall(int n, const std::function<int()> &work)
 {
     const pid_t child = inChild([&] {
@@ -89,6 +74,35 @@ bool killAtSystemCall(int n, const std::function<int()> &work)
     kill(child, SIGKILL);
     waitpid(child, &status, 0);
     return true;
+}
+
+} // namespace
+
+StateKeeper::StateKeeper()
+    : process(inChild([] {
+          openDatabase();
+          return pause();
+      }))
+{
+}
+
+StateKeeper::~StateKeeper()
+{
+    kill(process, SIGKILL);
+    waitpid(process, nullptr, 0);
+}
+
+void killAtEverySystemCall(int least, const std::function<void()> &prepare, const std::function<int()> &work,
+                           const std::function<void()> &check)
+{
+    int n = 0;
+    for (bool killed = true; killed && !testing::Test::HasFailure(); ++n) {
+        SCOPED_TRACE("killed before call " + std::to_string(n));
+        prepare();
+        killed = killAtSystemCall(n, work);
+        check();
+    }
+    EXPECT_LT(least, n) << "the work was not followed";
 }
 
 } // namespace norvhost

@@ -18,8 +18,9 @@ private:
     pid_t process;
 };
 
-/// Kills a process of its own before the n-th system call of the work that may change something; false when the work
-/// ended before.
-bool killAtSystemCall(int n, const std::function<int()> &work);
+/// Kills the work before each of its system calls that may change something, from the same beginning each time, and
+/// looks at what is left. It must have more of them than `least`, or it was not followed.
+void killAtEverySystemCall(int least, const std::function<void()> &prepare, const std::function<int()> &work,
+                           const std::function<void()> &check);
 
 } // namespace norvhost

@@ -17,17 +17,9 @@ namespace {
 struct KillTest : HostTest {
     const StateKeeper keeper;
 
-    /// Kills the work at each of its system calls, from the same beginning each time.
     void killEverywhere(const std::function<void()> &prepare, const std::function<int()> &work)
     {
-        int n = 0;
-        for (bool killed = true; killed && !HasFailure(); ++n) {
-            SCOPED_TRACE("killed at stop " + std::to_string(n));
-            prepare();
-            killed = killAtSystemCall(n, work);
-            expectNextCommandsWork();
-        }
-        EXPECT_LT(20, n) << "the work was not followed";
+        killAtEverySystemCall(20, prepare, work, [this] { expectNextCommandsWork(); });
     }
 
     void expectNextCommandsWork()

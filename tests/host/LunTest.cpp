@@ -233,20 +233,16 @@ TEST_F(LunTest, MissingOrShortDataIsUnhealthyAndCanBeDeleted)
 TEST_F(LunTest, ManyCreatorsAndDeletersGetIdsOfTheirOwn)
 {
     // Also the store's first opening is theirs: each child finds none.
-    std::vector<pid_t> workers;
-    for (int worker = 0; worker < 8; ++worker)
-        workers.push_back(inChild([&, worker] {
-            for (int i = 0; i < 8; ++i) {
-                _tag_iscsi_lun_ lun = wanted("lun-" + std::to_string(worker) + "-" + std::to_string(i));
-                if (NORViSCSILunCreate(&lun) != 0)
-                    return 1;
-                if (i % 2 && NORViSCSILunDelete(&lun) != 0)
-                    return 2;
-            }
-            return 0;
-        }));
-    for (pid_t worker : workers)
-        EXPECT_EQ(0, waitForChild(worker));
+    EXPECT_EQ(0, inChildren(8, [&](int worker) {
+                  for (int i = 0; i < 8; ++i) {
+                      _tag_iscsi_lun_ lun = wanted("lun-" + std::to_string(worker) + "-" + std::to_string(i));
+                      if (NORViSCSILunCreate(&lun) != 0)
+                          return 1;
+                      if (i % 2 && NORViSCSILunDelete(&lun) != 0)
+                          return 2;
+                  }
+                  return 0;
+              }));
     EXPECT_EQ(32u, namedFiles().size());
     expectConsistent();
 }

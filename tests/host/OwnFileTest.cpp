@@ -129,34 +129,27 @@ TEST_F(OwnFileTest, ChangesKilledAtEverySystemCallAreWholeOrNotMade)
 {
     ASSERT_EQ(0, NLIBCFileTouch(path.c_str()));
     const std::string big(200000, 'x');
-    int n = 0;
-    for (bool killed = true; killed && !HasFailure(); ++n) {
-        SCOPED_TRACE("killed at stop " + std::to_string(n));
-        write("[a]\n\tkey=old\n[b]\n\tkey=" + big + "\n");
-        killed = killAtSystemCall(n, [&] { return set("a", "a", {{"key", "new"}}) == 1 ? 0 : 1; });
+    const auto prepare = [&] { write("[a]\n\tkey=old\n[b]\n\tkey=" + big + "\n"); };
+    const auto change = [&] { return set("a", "a", {{"key", "new"}}) == 1 ? 0 : 1; };
+    killAtEverySystemCall(5, prepare, change, [&] {
         EXPECT_EQ("a b ", names());
         EXPECT_EQ(big, get("b", "key"));
         const std::string value = get("a", "key");
         EXPECT_TRUE(value == "old" || value == "new") << value;
         EXPECT_EQ(1, set("a", "a", {{"key", "next"}})) << iscsi_host_last_error();
         EXPECT_EQ("next", get("a", "key"));
-    }
-    EXPECT_LT(5, n) << "the work was not followed";
+    });
 }
 
 TEST_F(OwnFileTest, ChangesAtOnceAllLast)
 {
     ASSERT_EQ(0, NLIBCFileTouch(path.c_str()));
-    std::vector<pid_t> writers;
-    for (int writer = 0; writer < 8; ++writer)
-        writers.push_back(inChild([&] {
-            for (int i = 0; i < 10; ++i)
-                if (add(std::to_string(writer * 10 + i), {{"key", "value"}}) != 1)
-                    return 1;
-            return 0;
-        }));
-    for (const pid_t writer : writers)
-        EXPECT_EQ(0, waitForChild(writer));
+    EXPECT_EQ(0, inChildren(8, [&](int writer) {
+                  for (int i = 0; i < 10; ++i)
+                      if (add(std::to_string(writer * 10 + i), {{"key", "value"}}) != 1)
+                          return 1;
+                  return 0;
+              }));
     for (int i = 0; i < 80; ++i)
         EXPECT_EQ("value", get(std::to_string(i), "key")) << i;
 }

@@ -205,16 +205,10 @@ TEST_F(ScheduleTest, TwoRunnersNeverTakeTheSameJob)
         add(create("lun" + std::to_string(i), NORV_LUN_TYPE_ADV), "1m");
     closeDatabase();
     const int64_t now = time(nullptr) + 3600;
-    std::vector<pid_t> runners;
-    for (int i = 0; i < 8; ++i)
-        runners.push_back(inChild([now] {
-            std::vector<iscsihost::Schedule> due;
-            return claimDueSchedules(now, due) == 0 ? static_cast<int>(due.size()) : 100;
-        }));
-    int claimed = 0;
-    for (const pid_t runner : runners)
-        claimed += waitForChild(runner);
-    EXPECT_EQ(20, claimed);
+    EXPECT_EQ(20, inChildren(8, [now](int) {
+                  std::vector<iscsihost::Schedule> due;
+                  return claimDueSchedules(now, due) == 0 ? static_cast<int>(due.size()) : 100;
+              }));
 }
 
 TEST_F(ScheduleTest, JobsBelongToLuns)

@@ -256,14 +256,9 @@ TEST_F(SessionTest, OneTimeCodesAreAcceptedOnce)
     EXPECT_EQ(NORV_ERR_LOGIN, logIn("alice", "wrong", here, code(0)));
     EXPECT_EQ(0, logInWith(code(0))) << "a wrong password used the code up";
     const std::string next = code(1);
-    std::vector<pid_t> logins;
     closeDatabase();
-    for (int i = 0; i < 4; ++i)
-        logins.push_back(inChild([&] { return logIn("alice", password, here, next) == 0 ? 0 : 1; }));
-    int refused = 0;
-    for (const pid_t child : logins)
-        refused += waitForChild(child);
-    EXPECT_EQ(3, refused) << "a code that was read over a shoulder opens a session";
+    EXPECT_EQ(3, inChildren(4, [&](int) { return logIn("alice", password, here, next) == 0 ? 0 : 1; }))
+        << "a code that was read over a shoulder opens a session";
     EXPECT_EQ(NORV_ERR_LOGIN, logInWith(code(0))) << "an older one comes back";
 }
 
@@ -272,17 +267,13 @@ TEST_F(SessionTest, ManyLogInAndUseTheirSessionsAtOnce)
     addAccount("alice");
     const std::string shared = token("alice");
     closeDatabase();
-    std::vector<pid_t> users;
-    for (int i = 0; i < 16; ++i)
-        users.push_back(inChild([&] {
-            const std::string own = token("alice");
-            for (int call = 0; call < 50; ++call)
-                if (use(own) != 0 || use(shared) != 0)
-                    return 1;
-            return logout(own) == 0 ? 0 : 2;
-        }));
-    for (const pid_t user : users)
-        EXPECT_EQ(0, waitForChild(user));
+    EXPECT_EQ(0, inChildren(16, [&](int) {
+                  const std::string own = token("alice");
+                  for (int call = 0; call < 50; ++call)
+                      if (use(own) != 0 || use(shared) != 0)
+                          return 1;
+                  return logout(own) == 0 ? 0 : 2;
+              }));
     EXPECT_EQ(1u, countSessions());
 
     // A call that only asks must not wait for a writer.
@@ -309,13 +300,8 @@ TEST_F(SessionTest, GuessesAtOnceAreDelayedAsThoseInTurn)
     addAccount("alice");
     closeDatabase();
     const time_t begin = time(nullptr);
-    std::vector<pid_t> guesses;
-    for (int i = 0; i < 16; ++i)
-        guesses.push_back(
-            inChild([i] { return logIn("alice", "wrong", "192.0.2." + std::to_string(i)) == NORV_ERR_LOGIN; }));
-    int looked_at = 0;
-    for (const pid_t guess : guesses)
-        looked_at += waitForChild(guess);
+    const int looked_at =
+        inChildren(16, [](int i) { return logIn("alice", "wrong", "192.0.2." + std::to_string(i)) == NORV_ERR_LOGIN; });
     EXPECT_LE(3, looked_at);
     EXPECT_GE(3 + (time(nullptr) - begin), looked_at);
 }

@@ -76,26 +76,30 @@ TEST_F(StateTest, UncommittedChangesAreUndone)
     EXPECT_EQ("value", setting("key"));
 }
 
+TEST_F(StateTest, ParentAndChildUseItAfterAFork)
+{
+    ASSERT_EQ(0, setSetting("key", "parent"));
+    EXPECT_EQ(0, waitForChild(inChild([] { return setSetting("key", "child"); })));
+    EXPECT_EQ("child", setting("key"));
+    ASSERT_EQ(0, setSetting("key", "parent"));
+}
+
 TEST_F(StateTest, ManyProcessesOpenAndWriteAtOnce)
 {
     closeDatabase();
     std::filesystem::remove_all(root + "/state");
-    std::vector<pid_t> writers;
-    for (int writer = 0; writer < 12; ++writer)
-        writers.push_back(inChild([writer] {
-            for (int i = 0; i < 10; ++i) {
-                Transaction transaction;
-                std::string value;
-                if (transaction.error() || getSetting("sum", "0", value) ||
-                    setSetting("sum", std::to_string(std::stoi(value) + 1)) || transaction.commit())
-                    return 1;
-                if (i == writer % 10)
-                    closeDatabase();
-            }
-            return 0;
-        }));
-    for (pid_t writer : writers)
-        EXPECT_EQ(0, waitForChild(writer));
+    EXPECT_EQ(0, inChildren(12, [](int writer) {
+                  for (int i = 0; i < 10; ++i) {
+                      Transaction transaction;
+                      std::string value;
+                      if (transaction.error() || getSetting("sum", "0", value) ||
+                          setSetting("sum", std::to_string(std::stoi(value) + 1)) || transaction.commit())
+                          return 1;
+                      if (i == writer % 10)
+                          closeDatabase();
+                  }
+                  return 0;
+              }));
     EXPECT_EQ("120", setting("sum"));
 }
 

@@ -4,6 +4,7 @@
 #include "iscsihost/web.h"
 #include "platform/dr_node.h"
 #include "platform/error.h"
+#include "platform/extent_pool.h"
 
 #include <gmock/gmock.h>
 
@@ -166,11 +167,16 @@ TEST_F(NodeTest, AttributesAreOfKnownNodesAndTheLocalOne)
     EXPECT_EQ("3", attributes[1].value);
 }
 
-TEST_F(NodeTest, PeersAreToldTheSetAddress)
+TEST_F(NodeTest, PeersAreToldTheKeyAndTheSetAddress)
 {
     PairedNode described;
     EXPECT_EQ(NORV_ERR_FILE_NOT_FOUND, describeLocalNode("127.0.0.1", described)) << "it has no web server yet";
     ASSERT_EQ(0, iscsihost::makeWebCertificate()) << reason();
+    ASSERT_EQ(0, describeLocalNode("127.0.0.1", described)) << reason();
+    char key[64] = {};
+    ASSERT_EQ(0, NORVExtentPoolRODKeyGet(key, sizeof key)) << reason();
+    EXPECT_EQ(key, described.rod_key);
+    EXPECT_EQ(DRNode::getLocalNodeId(), described.uuid);
     const auto told = [](const char *address) {
         PairedNode node;
         EXPECT_EQ(0, iscsihost::setNodeAddress(address)) << reason();
