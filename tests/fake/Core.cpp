@@ -19,8 +19,6 @@ using namespace fake;
 
 namespace {
 
-int unfreed_lists = 0;
-
 std::string trimmed(const std::string &text, const char *what)
 {
     const size_t start = text.find_first_not_of(what);
@@ -48,11 +46,6 @@ const char *shown(const char *text)
 }
 
 } // namespace
-
-int fake::unfreedLists()
-{
-    return unfreed_lists;
-}
 
 void fake::pushText(NLIBC_SZ_LIST &list, const std::string &text)
 {
@@ -115,8 +108,7 @@ NLIBC_SZ_LIST *NLIBCSzListAlloc(int capacity)
 {
     if (called(__func__, capacity))
         return nullptr;
-    ++unfreed_lists;
-    return new NLIBC_SZ_LIST{0, capacity, new char *[static_cast<size_t>(capacity)]};
+    return noted(new NLIBC_SZ_LIST{0, capacity, new char *[static_cast<size_t>(capacity)]});
 }
 
 void NLIBCSzListFree(NLIBC_SZ_LIST *list)
@@ -126,8 +118,8 @@ void NLIBCSzListFree(NLIBC_SZ_LIST *list)
     for (int i = 0; i < list->count; ++i)
         free(list->texts[i]);
     delete[] list->texts;
+    noteFreed(list);
     delete list;
-    --unfreed_lists;
 }
 
 const char *NLIBCSzListGet(const NLIBC_SZ_LIST *list, int index)

@@ -46,27 +46,27 @@ Script &script()
     return the_script;
 }
 
-std::unordered_set<const void *> &listedRecords()
+std::unordered_set<const void *> &unfreed()
 {
-    static auto *records = new std::unordered_set<const void *>; // outlives whoever frees late
-    return *records;
+    static auto *answers = new std::unordered_set<const void *>; // outlives whoever frees late
+    return *answers;
 }
 
 } // namespace
 
-void noteListed(const void *memory)
+void noteAllocated(const void *memory)
 {
-    listedRecords().insert(memory);
+    unfreed().insert(memory);
 }
 
 void noteFreed(const void *memory)
 {
-    listedRecords().erase(memory);
+    unfreed().erase(memory);
 }
 
-int unfreedRecords()
+int unfreedAnswers()
 {
-    return static_cast<int>(listedRecords().size());
+    return static_cast<int>(unfreed().size());
 }
 
 Model &model()

@@ -36,7 +36,6 @@ struct LUN {
     static constexpr int MISSING = NORV_ERR_NO_SUCH_LUN;
 
     _tag_iscsi_lun_ record{};
-    bool is_loaded = true;
     bool is_locked = false;
     int progress = NORV_LUN_IDLE;
     std::string health = "Healthy";
@@ -47,7 +46,6 @@ struct Snapshot {
     static constexpr int MISSING = NORV_ERR_NO_SUCH_SNAPSHOT;
 
     _tag_iscsi_snapshot_ record{};
-    bool is_loaded = false;
     bool is_locked = false; ///< by an action
     std::set<std::string> app_keys;
     uint64_t copied = 0, to_copy = 0; ///< of the replication that fills it
@@ -130,7 +128,6 @@ struct Model {
     std::vector<_tag_iscsi_mapping_> mappings; ///< links unused; any target ID
     std::map<long, Job> jobs;
     std::set<std::pair<std::string, std::string>> retention_policies; ///< kind and key
-    size_t retention_keeps = 1;                                       ///< newest things that every policy keeps
     int exit_status = 0;                                              ///< of every program run
     unsigned int uuids_made = 0;
 

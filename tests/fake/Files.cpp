@@ -21,8 +21,6 @@ namespace {
 
 constexpr int LAST_FAILURE = 0x0900;
 
-int unfreed_hashes = 0;
-
 std::string *findValue(std::vector<std::pair<std::string, std::string>> &values, const std::string &key)
 {
     for (auto &[name, value] : values) {
@@ -100,11 +98,6 @@ int lockFile(const char *path, int *fd)
 
 } // namespace
 
-int fake::unfreedHashes()
-{
-    return unfreed_hashes;
-}
-
 std::vector<std::string> fake::lockedFiles()
 {
     std::vector<std::string> locked;
@@ -146,16 +139,12 @@ int NLIBCFileTouch(const char *path)
 
 NLIBC_SZ_HASH *NLIBCSzHashAlloc(int capacity)
 {
-    if (called(__func__, capacity))
-        return nullptr;
-    ++unfreed_hashes;
-    return new NLIBC_SZ_HASH;
+    return called(__func__, capacity) ? nullptr : noted(new NLIBC_SZ_HASH);
 }
 
 void NLIBCSzHashFree(NLIBC_SZ_HASH *hash)
 {
-    if (hash)
-        --unfreed_hashes;
+    noteFreed(hash);
     delete hash;
 }
 

@@ -68,7 +68,7 @@ int NORVRETENTIONRunPolicy(const char *kind, const char *key, NORV_RETENTION_TAR
         free(target);
     }
     std::sort(targets.begin(), targets.end(), [](const auto &a, const auto &b) { return a.time > b.time; });
-    for (size_t i = model().retention_keeps; i < targets.size(); ++i) {
+    for (size_t i = 1; i < targets.size(); ++i) { // every policy keeps the newest
         if (!targets[i].protected_)
             remove(key, &targets[i]);
     }

@@ -99,7 +99,6 @@ int setLoaded(const char *name, const _tag_iscsi_lun_ &record, bool is_loaded)
         return *failure;
     const uint32_t trash = record.options & NORV_LUN_OPTION_TRASH;
     lun->record.options = is_loaded ? lun->record.options & ~trash : lun->record.options | trash;
-    lun->is_loaded = is_loaded;
     return 0;
 }
 

@@ -23,23 +23,6 @@ struct NORV_CGI {
 
 namespace {
 
-int unfreed_handles = 0;
-
-template <class Handle>
-Handle *makeHandle()
-{
-    ++unfreed_handles;
-    return new Handle;
-}
-
-template <class Handle>
-void freeHandle(Handle *handle)
-{
-    if (handle)
-        --unfreed_handles;
-    delete handle;
-}
-
 template <class Value>
 int setOption(NORV_CGI *cgi, int option, const Value &value)
 {
@@ -57,11 +40,6 @@ int putText(char *out, int size, const Value &text)
 }
 
 } // namespace
-
-int fake::unfreedHandles()
-{
-    return unfreed_handles;
-}
 
 namespace NorvDRNode {
 
@@ -137,22 +115,24 @@ int NORVExtentPoolRODKeyGet(char *key, int size)
 
 NORV_CRED *NORVCredAlloc()
 {
-    return called(__func__) ? nullptr : makeHandle<NORV_CRED>();
+    return called(__func__) ? nullptr : noted(new NORV_CRED);
 }
 
 void NORVCredFree(NORV_CRED *cred)
 {
-    freeHandle(cred);
+    noteFreed(cred);
+    delete cred;
 }
 
 NORV_CRED_SESS *NORVCredSessAlloc()
 {
-    return called(__func__) ? nullptr : makeHandle<NORV_CRED_SESS>();
+    return called(__func__) ? nullptr : noted(new NORV_CRED_SESS);
 }
 
 void NORVCredSessFree(NORV_CRED_SESS *session)
 {
-    freeHandle(session);
+    noteFreed(session);
+    delete session;
 }
 
 int NORVCredItemSetHost(NORV_CRED *cred, const char *host)
@@ -220,13 +200,14 @@ bool CredRequestUtil::Logout(const NORV_CRED *cred, const std::string &token)
 int NorvCgiInit(const char *arguments, NORV_CGI **cgi)
 {
     NOTE_CALL(arguments);
-    *cgi = makeHandle<NORV_CGI>();
+    *cgi = noted(new NORV_CGI);
     return 0;
 }
 
 void NorvCgiFree(NORV_CGI *cgi)
 {
-    freeHandle(cgi);
+    noteFreed(cgi);
+    delete cgi;
 }
 
 int NorvCgiSetOption(NORV_CGI *cgi, int option, unsigned int value)
@@ -259,11 +240,11 @@ bool NorvCgiRemoveSessionByIndex(NORV_CGI *, int kind, const char *session)
 int NORVUserGetUGID(const char *name, unsigned int *uid, unsigned int *gid)
 {
     NOTE_CALL(name);
-    const auto found = model().account_ids.find(name);
-    if (found == model().account_ids.end())
+    const auto *ids = valueOf(model().account_ids, name);
+    if (!ids)
         return -1;
-    *uid = found->second.first;
-    *gid = found->second.second;
+    *uid = ids->first;
+    *gid = ids->second;
     return 0;
 }
 

@@ -85,8 +85,7 @@ int NORViSCSIReplicationTaskConfLoad(const _tag_iscsi_task_selection_ *selection
     const auto failure = called(__func__, memcmp(selection, &all, sizeof(all)) == 0 ? "all" : "some", flags);
     _tag_iscsi_task_ *last = head;
     for (const Task &task : model().tasks) {
-        auto *record = static_cast<_tag_iscsi_task_ *>(malloc(sizeof(_tag_iscsi_task_)));
-        noteListed(record);
+        auto *record = noted(static_cast<_tag_iscsi_task_ *>(malloc(sizeof(_tag_iscsi_task_))));
         *record = task.record;
         record->forward = nullptr;
         record->backward = last;

@@ -131,12 +131,15 @@ inline bool isPlatforms(const std::string &path)
 /// Appends to a list of texts while it has room.
 void pushText(NLIBC_SZ_LIST &list, const std::string &text);
 
-/// A record of a listing, from the C allocator, that counts as unfreed until noteFreed() sees it.
-void noteListed(const void *memory);
-int unfreedRecords();
-int unfreedLists();
-int unfreedHashes();
-int unfreedHandles();
+/// Something that the caller is to free: it counts as unfreed until noteFreed() sees it.
+void noteAllocated(const void *memory);
+
+template <class Thing>
+Thing *noted(Thing *thing)
+{
+    noteAllocated(thing);
+    return thing;
+}
 
 /// Closes every lock file.
 void forgetLocks();

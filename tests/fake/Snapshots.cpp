@@ -47,7 +47,6 @@ int setLoaded(const char *name, const _tag_iscsi_snapshot_ &record, bool is_load
     if (is_loaded && !trash && snapshot->record.flags & NORV_SNAPSHOT_TRASH)
         return NORV_ERR_SNAPSHOT_NOT_LOADED;
     snapshot->record.flags = is_loaded ? snapshot->record.flags & ~trash : snapshot->record.flags | trash;
-    snapshot->is_loaded = is_loaded;
     if (!is_loaded)
         snapshot->is_locked = false;
     return 0;
@@ -84,8 +83,7 @@ int NORViSCSISnapshotConfLoad(const _tag_iscsi_snapshot_query_ *query, _tag_iscs
     for (const auto &[key, snapshot] : model().snapshots) {
         if (!isAsked(*query, snapshot.record))
             continue;
-        auto *record = static_cast<_tag_iscsi_snapshot_ *>(malloc(sizeof(_tag_iscsi_snapshot_)));
-        noteListed(record);
+        auto *record = noted(static_cast<_tag_iscsi_snapshot_ *>(malloc(sizeof(_tag_iscsi_snapshot_))));
         *record = snapshot.record;
         record->previous = list->last;
         record->next = nullptr;

@@ -11,17 +11,15 @@ using namespace fake;
 
 namespace {
 
-int unfreed = 0;
-
 /// An answer with what its lists point into.
 struct Answer : _tag_iscsi_conf_ {
     std::vector<_tag_iscsi_target_> target_list;
     std::vector<_tag_iscsi_mapping_> mapping_list;
 
-    Answer() : _tag_iscsi_conf_{} { ++unfreed; }
+    Answer() : _tag_iscsi_conf_{} { noteAllocated(this); }
     Answer(const Answer &) = delete;
     Answer &operator=(const Answer &) = delete;
-    ~Answer() { --unfreed; }
+    ~Answer() { noteFreed(this); }
 
     /// Call once, when the lists are complete.
     Answer *linked()
@@ -130,11 +128,6 @@ int judge(const _tag_iscsi_target_ &target)
 }
 
 } // namespace
-
-int fake::unfreedAnswers()
-{
-    return unfreed + unfreedRecords() + unfreedLists() + unfreedHashes() + unfreedHandles();
-}
 
 int NORViSCSIConfGet(const _tag_iscsi_conf_query_ *query, _tag_iscsi_conf_ **conf)
 {

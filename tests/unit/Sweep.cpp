@@ -186,6 +186,7 @@ TEST_P(FailureSweep, EveryFailingCallIsReported)
     start(operation);
     Clean clean{{}, operation.untouched};
     ASSERT_EQ(operation.run(clean.outputs), 0);
+    EXPECT_TRUE(operation.done.empty() || clean.outputs == operation.done) << clean.outputs;
     const Lines lines = logged();
     EXPECT_TRUE(areNotes(lines)) << testing::PrintToString(lines);
     EXPECT_EQ(fake::lockedFiles(), Lines());

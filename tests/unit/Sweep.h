@@ -43,18 +43,19 @@ struct Operation {
     std::function<int(std::string &)> run; ///< changes the outputs, as text; returns the code
     std::string untouched;                 ///< outputs before, and after a failure; empty: they may change
     Failures failures = {};
+    std::string done = {}; ///< outputs of success, where no other test sees to them
 };
 
 /// The same, for an operation on an object that `make` makes.
 template <class Make, class Act>
 Operation on(Make make, const char *name, void (*set_up)(), Act act, const std::string &untouched,
-             const Failures &failures)
+             const Failures &failures, const std::string &done = "")
 {
     const auto run = [make, act](std::string &outputs) {
         auto subject = make();
         return act(subject, outputs);
     };
-    return {name, set_up, run, untouched, failures};
+    return {name, set_up, run, untouched, failures, done};
 }
 
 class FailureSweep : public LibraryTest, public testing::WithParamInterface<Operation> {};

@@ -131,9 +131,9 @@ const Operation operations[] = {
         {"NORVSchedTaskRemove#2", 0, Then::ONLY_THE_LOG_TELLS, ": NORVSchedTaskRemove() fail, schedule id = 12"},
         {"NORViSCSILunDelete", 18990551, "deleteLUN: Failed to delete LUN: "}}),
     on(theLUN, "isLUNLocked", mappedLUN, question<&ISCSILIBLUN::isLUNLocked>, "no",
-       {{"NORViSCSILunIsLocked", INJECTED, "isLUNLocked: Failed to check if LUN is locked."}}),
+       {{"NORViSCSILunIsLocked", INJECTED, "isLUNLocked: Failed to check if LUN is locked."}}, "yes"),
     on(theLUN, "isLUNMapped", mappedLUN, question<&ISCSILIBLUN::isLUNMapped>, "no",
-       {{"NORViSCSIConfGet", 18990557, "isLUNMapped: Failed to list LUN's mapping targets."}}),
+       {{"NORViSCSIConfGet", 18990557, "isLUNMapped: Failed to list LUN's mapping targets."}}, "yes"),
     on(theLUN, "loadLUN", mappedLUN, [](auto &lun, auto &) { return lun.loadLUN(true, false); }, "",
        {{"NORViSCSILunLoad", INJECTED,
          "loadLUN: Failed to load LUN. is_for_trash: true, is_for_unsync_size: false info: "}}),
@@ -222,7 +222,7 @@ const Operation operations[] = {
         Failure("NLIBCFileGetKeyValue#2", 18990017).leaving("0 9 9"),
         Failure("NLIBCFileGetKeyValue#3", 18990017).leaving("0 1 9")}),
     on(theLUN, "getSyncProgress", exportedSnapshot, syncProgress, "9 9",
-       {{"NORViSCSIChildLunSyncProgressGet", INJECTED, "getSyncProgress: Failed to load sync progress."}}),
+       {{"NORViSCSIChildLunSyncProgressGet", INJECTED, "getSyncProgress: Failed to load sync progress."}}, "0 5"),
 };
 
 INSTANTIATE_TEST_SUITE_P(LUNOperations, FailureSweep, testing::ValuesIn(operations), operationName);

@@ -100,20 +100,6 @@ TEST_F(LUNOperations, DeleteRemovesTheJobsOfExtentPoolLUNs)
     EXPECT_EQ(called({"NORVSchedTaskRemove"}), Lines{"NORVSchedTaskRemove(0)"}) << "and no other schedule exists";
 }
 
-TEST_F(LUNOperations, LockAndMappingQueries)
-{
-    addLUN(3, "vol1");
-    for (bool expected : {false, true}) {
-        bool is_locked = !expected, is_mapped = !expected;
-        fake::model().luns.at(3).is_locked = expected;
-        EXPECT_EQ(lun.isLUNLocked(is_locked), 0);
-        EXPECT_EQ(lun.isLUNMapped(is_mapped), 0);
-        EXPECT_EQ(is_locked, expected);
-        EXPECT_EQ(is_mapped, expected);
-        addMapping(256, 3);
-    }
-}
-
 TEST_F(LUNOperations, LoadOptions)
 {
     addLUN(3, "vol1");
@@ -128,7 +114,6 @@ TEST_F(LUNOperations, LoadOptions)
         fake::model().luns.at(3).record.options = 8;
         EXPECT_EQ(lun.unloadLUN(c.trash, c.unsync_size), 0);
         EXPECT_EQ(called(), (Lines{loaded, "NORViSCSILunUnload(" + uuidOf(3) + ", " + c.options + ")"}));
-        EXPECT_FALSE(fake::model().luns.at(3).is_loaded);
     }
 }
 

@@ -117,15 +117,5 @@ TEST_F(Transfers, ImportProgressIsReadFromItsFile)
     EXPECT_EQ(total, 10u);
 }
 
-TEST_F(Transfers, SyncProgressIsThatOfTheLUN)
-{
-    fake::model().luns.at(lid).map_file.copied = 3;
-    fake::model().luns.at(lid).map_file.to_copy = 5;
-    unsigned long long done = 9, total = 9;
-    EXPECT_EQ(lun.getSyncProgress(done, total), 0);
-    EXPECT_EQ(done, 3u);
-    EXPECT_EQ(total, 5u);
-}
-
 } // namespace
 } // namespace unit

@@ -114,12 +114,12 @@ const Operation operations[] = {
     on(theTask, "sendSnapshotNotAligned", sourceBehind, send, "",
        SENT + Failures{{"WebAPIClientLUNGet WebAPIClientLUNSet NORViSCSIReplicationTaskSendSnapshot", 0,
                         Then::ONLY_THE_LOG_TELLS}}),
-    on(theTask, "getReplicationBaseVersion", alignedDestination, chooseBase, " other", LOCKED),
+    on(theTask, "getReplicationBaseVersion", alignedDestination, chooseBase, " other", LOCKED, SNAPSHOT + " same"),
     on(
         theTask, "startToComputeUnsyncSize", sourceSide,
         [](auto &task, auto &) { return task.startToComputeUnsyncSize(BASE, SNAPSHOT); }, "", LOADED),
-    on(theTask, "getCurrentUnsyncSize", sourceSide, unsyncSize, "9", LOCKED),
-    on(theTask, "getSendingStatus", sourceSide, sendingStatus, "9999", LOADED),
+    on(theTask, "getCurrentUnsyncSize", sourceSide, unsyncSize, "9", LOCKED, "0 in all"),
+    on(theTask, "getSendingStatus", sourceSide, sendingStatus, "9999", LOADED, "1200"),
     on(
         theTask, "stopSending", sourceSide, [](auto &task, auto &) { return task.stopSending(); }, "", LOADED),
     on(theTask, "getReplicationStatus", sourceSide, status, " locked",
