@@ -17,7 +17,11 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 
-constexpr int ask_again_ms = 20;
+constexpr int ask_again_ms = 10;
+
+/// Who asks without waiting is refused by what works, not by who only reads: every reader of the node configuration
+/// holds its lock for so long as that takes.
+constexpr auto for_a_moment = std::chrono::milliseconds(200);
 
 struct flock wholeFile(int type)
 {
@@ -61,7 +65,7 @@ int tryLock(const FilePlace &place, int type, FileDescriptor &locked)
 }
 
 /// 1 on success, else 0.
-int lockWithin(const char *path, int exclusive, std::chrono::seconds limit, int *fd)
+int lockWithin(const char *path, int exclusive, std::chrono::milliseconds limit, int *fd)
 {
     if (!fd) {
         fail(NORV_ERR_NULL_POINTER, "no place for the descriptor of a lock");
@@ -101,7 +105,7 @@ int norvhost::fileLockHeld(const char *path, bool &held)
 
 int NLIBCFileLockByFile(const char *path, int exclusive, int *fd)
 {
-    return lockWithin(path, exclusive, std::chrono::seconds(0), fd);
+    return lockWithin(path, exclusive, for_a_moment, fd);
 }
 
 int NLIBCFileLockTimeByFile(const char *path, int exclusive, int seconds, int *fd)
