@@ -11,6 +11,8 @@ if(ISCSIWEBAPI_SANITIZE)
     target_compile_options(project_options INTERFACE
         -fsanitize=address,undefined -fno-sanitize-recover=all -fno-omit-frame-pointer)
     target_link_options(project_options INTERFACE -fsanitize=address,undefined)
+    target_sources(project_options INTERFACE
+        $<$<STREQUAL:$<TARGET_PROPERTY:TYPE>,EXECUTABLE>:${PROJECT_SOURCE_DIR}/cmake/sanitizers.cpp>)
     # A sanitized shared library leaves the runtime to the program that loads it.
     set(ISCSIWEBAPI_ZDEFS "")
 else()

@@ -29,9 +29,9 @@ def argument_of(pid, text):
 def has_open(pid, name):
     """Whether the process, which may end meanwhile, has a file open whose path ends so."""
     with contextlib.suppress(FileNotFoundError, ProcessLookupError):
-        for file in os.scandir(f"/proc/{pid}/fd"):
+        for file in os.listdir(f"/proc/{pid}/fd"):
             with contextlib.suppress(FileNotFoundError):
-                if os.readlink(file.path).endswith(name):
+                if os.readlink(f"/proc/{pid}/fd/{file}").endswith(name):
                     return True
     return False
 
