@@ -99,8 +99,8 @@ bool isName(const std::string &text, size_t longest);
 template <class Record>
 int copyRecord(const Record &record, Record *out)
 {
-    static const Record zero{};
-    if (memcmp(out, &zero, sizeof(zero)) != 0)
+    const auto *const bytes = reinterpret_cast<const char *>(out);
+    if (std::any_of(bytes, bytes + sizeof(Record), [](char byte) { return byte != 0; }))
         return NORV_ERR_BAD_PARAMETER;
     *out = record;
     return 0;

@@ -241,7 +241,7 @@ TEST_F(SessionTest, OneTimeCodesAreAcceptedOnce)
         size_t length;
         char digits[7];
         EXPECT_EQ(OATH_OK, oath_base32_decode(secret.data(), secret.size(), &key, &length));
-        EXPECT_EQ(OATH_OK, oath_totp_generate(key, length, time(nullptr) + steps * 30, 30, 0, 6, digits));
+        EXPECT_EQ(OATH_OK, oath_totp_generate(key, length, time(nullptr) + steps * 30L, 30, 0, 6, digits));
         free(key);
         return std::string(digits);
     };

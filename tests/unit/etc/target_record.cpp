@@ -2,6 +2,7 @@
 #include "tests/unit/Library.h"
 
 #include <cstring>
+#include <string_view>
 #include <utility>
 
 namespace unit {
@@ -53,7 +54,10 @@ TEST_F(TargetRecord, FillsTheSDKsAndIsLoadedWithBothSecretsOfOneValue)
     EXPECT_EQ(target.toString(), EVERY_FIELD);
     EXPECT_EQ(target.password, SECRET);
     EXPECT_EQ(target.mutual_password, SECRET);
-    EXPECT_EQ(memcmp(&record, &known, sizeof(record)), 0);
+    const auto bytes = [](const _tag_iscsi_target_ &of) {
+        return std::string_view(reinterpret_cast<const char *>(&of), sizeof(of));
+    };
+    EXPECT_EQ(bytes(record), bytes(known));
 }
 
 TEST_F(TargetRecord, UnknownAuthTypesAreMarked)

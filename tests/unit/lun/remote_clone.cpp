@@ -53,14 +53,13 @@ TEST_F(RemoteClone, WithoutAWatcherItEndsWithTheBinding)
     EXPECT_EQ(clone.run(false), 0);
     EXPECT_EQ(clone.vlun_uuid, VLUN);
     EXPECT_EQ(clone.dst_lun_uuid, MADE);
-    EXPECT_EQ(
-        called(),
-        (Lines{"NORViSCSILunConfigGetByUUID(" + UUID + ", 0)", "NORViSCSIVirtualLunCreate(" + UUID + ", 2, 0)",
-               R"(WebAPIClientLUNCreate(peer.example, /luns, {"extent_size":8192,"location":"/volume2","name":"copy",)"
-               R"("size":1073741824,"type":31}))",
-               std::string("DRNodeDB::Get(") + PEER_NODE + ")",
-               std::string("DRNodeDB::ListAttr(") + PEER_NODE + ", NORV.iSCSI)",
-               "NORViSCSIVirtualLunBindSink(" + VLUN + ", a:3260, " + PEER_NODE + ", " + MADE + ")"}));
+    const std::string wish = R"({"extent_size":8192,"location":"/volume2","name":"copy","size":1073741824,"type":31})";
+    EXPECT_EQ(called(),
+              (Lines{"NORViSCSILunConfigGetByUUID(" + UUID + ", 0)", "NORViSCSIVirtualLunCreate(" + UUID + ", 2, 0)",
+                     "WebAPIClientLUNCreate(peer.example, /luns, " + wish + ")",
+                     std::string("DRNodeDB::Get(") + PEER_NODE + ")",
+                     std::string("DRNodeDB::ListAttr(") + PEER_NODE + ", NORV.iSCSI)",
+                     "NORViSCSIVirtualLunBindSink(" + VLUN + ", a:3260, " + PEER_NODE + ", " + MADE + ")"}));
     EXPECT_EQ(fake::model().virtual_luns.size(), 1u) << "the virtual LUN stays";
 }
 

@@ -101,11 +101,11 @@ TEST_F(Replication, CreatingMakesALUNAndATaskOnBothSides)
     EXPECT_EQ(record.is_source, 1);
     EXPECT_STREQ(record.root_path, "/volume1");
     const std::string poll = "WebAPIClientLUNGet(peer.example, /luns/" + MADE + ")";
+    const std::string wish = R"({"extent_size":8192,"location":"/volume2","name":"copy","size":1073741824,"type":31})";
     EXPECT_EQ(
         called({"WebAPI"}),
-        (Lines{R"(WebAPIClientLUNCreate(peer.example, /luns, {"extent_size":8192,"location":"/volume2",)"
-               R"("name":"copy","size":1073741824,"type":31}))",
-               poll, poll, poll, "WebAPIClientNodeGet(peer.example, peer.example)",
+        (Lines{"WebAPIClientLUNCreate(peer.example, /luns, " + wish + ")", poll, poll, poll,
+               "WebAPIClientNodeGet(peer.example, peer.example)",
                R"(WebAPIClientReplicationCreateTask(peer.example, /replications/tasks, {"dst_lun_uuid":")" + MADE +
                    R"(","dst_node_uuid":")" + PEER_NODE + R"(","is_source":false,"src_lun_uuid":")" + SOURCE +
                    R"(","src_node_uuid":")" + LOCAL_NODE + R"(","uuid":")" + creation.task.uuid + "\"})"}));
